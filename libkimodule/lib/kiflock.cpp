@@ -1,0 +1,67 @@
+#include "kiflock.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdint>
+#include <utility>
+
+namespace {
+
+constexpr int ATTEMPTS_PER_SEC = 10;
+constexpr useconds_t ATTEMPT_DELAY_USEC = 1000000 / ATTEMPTS_PER_SEC;
+
+}  // namespace
+
+KiFlock::KiFlock(std::string strName) : m_strName(std::move(strName)), m_Fd(-1) {}
+
+KiFlock::~KiFlock() { UnLock(); }
+
+int KiFlock::LockSh(int TimeoutSec) { return Flock(TimeoutSec, false); }
+
+int KiFlock::LockEx(int TimeoutSec) { return Flock(TimeoutSec, true); }
+
+void KiFlock::UnLock() {
+  if (m_Fd < 0) {
+    return;
+  }
+  UnLock(m_Fd);
+  close(m_Fd);
+  m_Fd = -1;
+}
+
+int KiFlock::Lock(int Fd, int TimeoutSec, bool blExclusive) {
+  const int Operation = blExclusive ? LOCK_EX : LOCK_SH;
+  if (TimeoutSec < 0) {
+    return flock(Fd, Operation);
+  }
+  if (TimeoutSec == 0) {
+    return flock(Fd, Operation | LOCK_NB);
+  }
+  int Ret = -1;
+  int Errno = 0;
+  for (int64_t Left = int64_t{TimeoutSec} * ATTEMPTS_PER_SEC; Left > 0; --Left) {
+    Ret = flock(Fd, Operation | LOCK_NB);
+    if (Ret == 0) {
+      return 0;
+    }
+    Errno = errno;
+    usleep(ATTEMPT_DELAY_USEC);
+  }
+  errno = Errno;
+  return Ret;
+}
+
+int KiFlock::UnLock(int Fd) { return flock(Fd, LOCK_UN); }
+
+int KiFlock::Flock(int TimeoutSec, bool blExclusive) {
+  if (m_Fd == -1) {
+    m_Fd = open(m_strName.c_str(), O_RDONLY | O_CREAT | O_CLOEXEC, 0644);
+    if (m_Fd == -1) {
+      return -1;
+    }
+  }
+  return Lock(m_Fd, TimeoutSec, blExclusive);
+}

@@ -1,0 +1,7 @@
+// Small, stateless helpers shared by the package's processes. All may be called from any thread.
+#pragma once
+
+#include <string>
+
+// The part of strFullPath after its last '/' or '\', or all of it when it has neither.
+std::string GetBaseName(const std::string& strFullPath);
