@@ -1,0 +1,46 @@
+// The platform's core library: keys of capability files, and the banner.
+//
+// A capability file is a text file of lines "key = value". Blanks (space, tab) around key and value
+// and a carriage return at the end of the line do not count, and neither does one pair of double
+// quotes around the value. Of several lines with one key the first counts. A line that starts with
+// '#' or has no '=' is never a key.
+//
+// Only regular files, or links to them, are ever opened; anything else holds no keys. A changed
+// file is replaced as a whole: whatever happens, the path leads to the old or to the new content,
+// with the owner, group and mode it had, and the new one is on stable storage before a call returns
+// success. Callers that change files of one directory, in any process, take turns. Why a change
+// failed goes to syslog at LOG_ERR. Any thread may call any of these.
+#pragma once
+
+#include <cstddef>
+
+// Copies the value of szKey to szValue, a buffer of Size bytes; a longer value is cut, and the copy
+// is always terminated. Returns the value's whole length, 0 when the key is absent or its value
+// empty, -1 when the file cannot be read (szValue is then empty). Flags are not used.
+int ZAMOCFileGetKeyValue(const char* szFile, const char* szKey, char* szValue, size_t Size,
+                         int Flags);
+
+// Sets szKey to szValue in an existing file: its first line is replaced by szFormat with its two
+// "%s" filled, further lines of the key are dropped, a new key is appended. All other bytes of the
+// file stay. Returns 0, or -1 with the file as it was: also for a key or value that a line cannot
+// hold, and for a format without two "%s".
+int ZAMOCFileSetKeyValue(const char* szFile, const char* szKey, const char* szValue,
+                         const char* szFormat);
+
+// Takes every line of szKey out of the file. Returns 1 when it did, 0 when there was none and the
+// file was left untouched, -1 on failure with the file as it was.
+int ZAMOCFileRemoveKey(const char* szFile, const char* szKey);
+
+// One change of a file: szKey is set to szValue in szFormat, or taken out when szValue is null.
+struct ZAMOCKeyChange {
+  const char* szKey;
+  const char* szValue;
+  const char* szFormat;
+};
+
+// Makes Count changes of different keys, each as the calls above would, in one replacement of the
+// file: all of them are made or none. Returns 0, or -1 with the file as it was.
+int ZAMOCFileChangeKeys(const char* szFile, const ZAMOCKeyChange* pChanges, size_t Count);
+
+// Writes one line with the tool's name and version to standard output.
+void ZAMOCCopyright();

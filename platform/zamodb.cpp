@@ -1,0 +1,178 @@
+#include "zamodb.h"
+
+#include <sqlite3.h>
+#include <sys/stat.h>
+#include <syslog.h>
+
+#include <memory>
+#include <new>
+#include <optional>
+#include <string>
+#include <vector>
+
+struct DBConnect_tag {
+  sqlite3* m_pDb = nullptr;
+
+  // Finishes nothing: a transaction that is still open is rolled back.
+  ~DBConnect_tag() { sqlite3_close(m_pDb); }
+};
+
+struct DBResult_tag {
+  std::vector<std::string> m_Columns;
+  std::vector<std::vector<std::optional<std::string>>> m_Rows;
+  DBRow m_NextRow = 0;
+};
+
+namespace {
+
+constexpr int BUSY_TIMEOUT_MSEC = 5000;
+
+struct StatementFinalizer {
+  void operator()(sqlite3_stmt* pStatement) const { sqlite3_finalize(pStatement); }
+};
+using Statement = std::unique_ptr<sqlite3_stmt, StatementFinalizer>;
+
+bool IsRegularFile(const char* szPath) {
+  struct stat Stat;
+  return stat(szPath, &Stat) == 0 && S_ISREG(Stat.st_mode);
+}
+
+void ReportFailure(sqlite3* pDb, const char* szDBName, const char* szReason) {
+  syslog(LOG_ERR, "zamodb: [%s]: %s (extended code %d)", szDBName, szReason,
+         sqlite3_extended_errcode(pDb));
+}
+
+// Copies the statement's current row; false when memory runs out.
+bool CopyRow(sqlite3_stmt* pStatement, DBResult* pResult) {
+  std::vector<std::optional<std::string>> Row(pResult->m_Columns.size());
+  for (int Column = 0; Column < static_cast<int>(Row.size()); ++Column) {
+    if (sqlite3_column_type(pStatement, Column) == SQLITE_NULL) {
+      continue;
+    }
+    const void* pText = sqlite3_column_text(pStatement, Column);
+    const int Len = sqlite3_column_bytes(pStatement, Column);
+    if (pText == nullptr) {
+      return false;
+    }
+    Row[static_cast<size_t>(Column)].emplace(static_cast<const char*>(pText),
+                                             static_cast<size_t>(Len));
+  }
+  pResult->m_Rows.push_back(std::move(Row));
+  return true;
+}
+
+// Runs one statement to its end; a statement that yields columns replaces *ppResult.
+int RunStatement(sqlite3_stmt* pStatement, std::unique_ptr<DBResult>* ppResult) {
+  const int Columns = sqlite3_column_count(pStatement);
+  if (Columns > 0) {
+    *ppResult = std::make_unique<DBResult>();
+    for (int Column = 0; Column < Columns; ++Column) {
+      const char* szName = sqlite3_column_name(pStatement, Column);
+      (*ppResult)->m_Columns.emplace_back(szName != nullptr ? szName : "");
+    }
+  }
+  int Step;
+  while ((Step = sqlite3_step(pStatement)) == SQLITE_ROW) {
+    if (Columns > 0 && !CopyRow(pStatement, ppResult->get())) {
+      return SQLITE_NOMEM;
+    }
+  }
+  return Step == SQLITE_DONE ? SQLITE_OK : Step;
+}
+
+int RunText(sqlite3* pDb, const char* szSqlCmd, std::unique_ptr<DBResult>* ppResult) {
+  while (*szSqlCmd != '\0') {
+    sqlite3_stmt* pPrepared = nullptr;
+    const int Prepare = sqlite3_prepare_v2(pDb, szSqlCmd, -1, &pPrepared, &szSqlCmd);
+    if (Prepare != SQLITE_OK) {
+      return Prepare;
+    }
+    const Statement pStatement(pPrepared);
+    if (pStatement == nullptr) {  // an empty statement, or only a comment
+      continue;
+    }
+    const int Run = RunStatement(pStatement.get(), ppResult);
+    if (Run != SQLITE_OK) {
+      return Run;
+    }
+  }
+  return SQLITE_OK;
+}
+
+}  // namespace
+
+DBConnect* ZAMODBConnect(const char* /*szHost*/, const char* /*szUser*/, const char* /*szPassword*/,
+                         const char* szDBName) {
+  // SQLite would take an empty name for a temporary database and ":memory:" for one in memory.
+  if (szDBName == nullptr || !IsRegularFile(szDBName)) {
+    return nullptr;
+  }
+  auto pConn = std::make_unique<DBConnect>();
+  if (sqlite3_open_v2(szDBName, &pConn->m_pDb, SQLITE_OPEN_READWRITE, nullptr) != SQLITE_OK) {
+    ReportFailure(pConn->m_pDb, szDBName, sqlite3_errmsg(pConn->m_pDb));
+    return nullptr;
+  }
+  if (sqlite3_db_readonly(pConn->m_pDb, "main") != 0) {
+    ReportFailure(pConn->m_pDb, szDBName, "the file cannot be written");
+    return nullptr;
+  }
+  sqlite3_busy_timeout(pConn->m_pDb, BUSY_TIMEOUT_MSEC);
+  return pConn.release();
+}
+
+int ZAMODBExecute(DBConnect* pConn, const char* szSqlCmd, DBResult** ppResult) {
+  if (pConn == nullptr || szSqlCmd == nullptr) {
+    return -1;
+  }
+  sqlite3* pDb = pConn->m_pDb;
+  std::unique_ptr<DBResult> pResult;
+  const char* szReason = nullptr;
+  const int Run = RunText(pDb, szSqlCmd, &pResult);
+  if (Run != SQLITE_OK) {
+    // Out of memory may be this layer's own, which SQLite's message would not show.
+    szReason = Run == SQLITE_NOMEM ? sqlite3_errstr(Run) : sqlite3_errmsg(pDb);
+  } else if (sqlite3_get_autocommit(pDb) == 0) {
+    // Closing would roll it back: success would promise rows that are not there.
+    szReason = "the text leaves a transaction open";
+  }
+  if (szReason != nullptr) {
+    ReportFailure(pDb, sqlite3_db_filename(pDb, "main"), szReason);
+    if (sqlite3_get_autocommit(pDb) == 0) {
+      sqlite3_exec(pDb, "ROLLBACK", nullptr, nullptr, nullptr);
+    }
+    return -1;
+  }
+  if (ppResult != nullptr) {
+    *ppResult = pResult.release();
+  }
+  return 0;
+}
+
+unsigned int ZAMODBNumRows(const DBResult* pResult) {
+  return pResult == nullptr ? 0 : static_cast<unsigned int>(pResult->m_Rows.size());
+}
+
+int ZAMODBFetchRow(DBResult* pResult, DBRow* pRow) {
+  if (pResult == nullptr || pRow == nullptr || pResult->m_NextRow >= pResult->m_Rows.size()) {
+    return -1;
+  }
+  *pRow = pResult->m_NextRow++;
+  return 0;
+}
+
+const char* ZAMODBFetchField(const DBResult* pResult, DBRow Row, const char* szColumn) {
+  if (pResult == nullptr || szColumn == nullptr || Row >= pResult->m_Rows.size()) {
+    return nullptr;
+  }
+  for (size_t Column = 0; Column < pResult->m_Columns.size(); ++Column) {
+    if (sqlite3_stricmp(pResult->m_Columns[Column].c_str(), szColumn) == 0) {
+      const std::optional<std::string>& Value = pResult->m_Rows[Row][Column];
+      return Value ? Value->c_str() : nullptr;
+    }
+  }
+  return nullptr;
+}
+
+void ZAMODBFreeResult(DBResult* pResult) { delete pResult; }
+
+void ZAMODBClose(DBConnect* pConn) { delete pConn; }
