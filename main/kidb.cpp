@@ -1,0 +1,88 @@
+#include "kidb.h"
+
+#include <map>
+#include <mutex>
+
+#include "kidebuglog.h"
+
+namespace {
+
+std::mutex gDBMutex[KiDB::DBI_CNT];
+
+}  // namespace
+
+namespace KiDB {
+
+// An unknown instance leaves both as they are.
+static void GetDBInfo(DB_INSTANCE DBInstance, std::string& strDBName, int& MutexIdx) {
+  switch (DBInstance) {
+    case DBI_SYSTEM:
+      strDBName = "/var/packages/Camveld/target/system.db";
+      MutexIdx = 0;
+      break;
+    case DBI_RECORDING:
+      strDBName = "/var/services/camveld/recording.db";
+      MutexIdx = 1;
+      break;
+    case DBI_CNT:
+      break;
+  }
+}
+
+static void ReplaceBoolForSqlite(std::string& strCmd) {
+  const std::map<std::string, std::string> BoolStrMap = {
+      {"false", "0"}, {"FALSE", "0"}, {"true", "1"}, {"TRUE", "1"}};
+  bool blReplaced = false;
+  for (const auto& [strWord, strDigit] : BoolStrMap) {
+    // A digit never makes a new word, so the search can go on where it stands.
+    for (size_t Pos = 0; (Pos = strCmd.find(strWord, Pos)) != std::string::npos;) {
+      strCmd.replace(Pos, strWord.size(), strDigit);
+      blReplaced = true;
+    }
+  }
+  if (blReplaced) {
+    KiPrintf(KI_LOG, nullptr, nullptr, __FILE__, __LINE__, __func__,
+             "Got sql cmd with bool replaced: %s\n", strCmd.c_str());
+  }
+}
+
+static DBConnect* KiDBConnect(const std::string& strDBName) {
+  return ZAMODBConnect(nullptr, "postgres", nullptr, strDBName.c_str());
+}
+
+int Execute(DB_INSTANCE DBInstance, std::string strCommand, DBResult_tag** ppResult,
+            bool blReplaceBoolForSqlite) {
+  int MutexIdx = 0;
+  std::string strDBName;
+  GetDBInfo(DBInstance, strDBName, MutexIdx);
+  if (blReplaceBoolForSqlite) {
+    ReplaceBoolForSqlite(strCommand);
+  }
+
+  const std::lock_guard<std::mutex> Lock(gDBMutex[MutexIdx]);
+  DBConnect* pConn = KiDBConnect(strDBName);
+  if (pConn == nullptr) {
+    KiPrintf(KI_LOG, nullptr, nullptr, __FILE__, __LINE__, __func__,
+             "Failed to connect to db[%d, %s].\n", DBInstance, strDBName.c_str());
+    return -1;
+  }
+  int Ret = 0;
+  DBResult* pCurrResult = nullptr;
+  strCommand = "BEGIN;" + strCommand + ";COMMIT;";
+  if (ZAMODBExecute(pConn, strCommand.c_str(), &pCurrResult) != 0) {
+    KiPrintf(KI_LOG, nullptr, nullptr, __FILE__, __LINE__, __func__,
+             "Failed to execute db[%d] cmd: %s.\n", DBInstance, strCommand.c_str());
+    Ret = -1;
+  }
+  if (Ret == 0 && ppResult != nullptr && pCurrResult != nullptr) {
+    *ppResult = pCurrResult;
+  } else {
+    ZAMODBFreeResult(pCurrResult);
+  }
+  ZAMODBClose(pConn);
+  return Ret;
+}
+
+void KiDBFreeResult(DBResult_tag* pResult) { ZAMODBFreeResult(pResult); }
+
+}  // namespace KiDB

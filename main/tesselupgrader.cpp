@@ -1,0 +1,601 @@
+// Brings the recorder's camera rows and capability files in line with a newly installed Tessel
+// package: runs every migration action whose version threshold lies above the version number of the
+// package that was installed before.
+
+#include <dirent.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <initializer_list>
+#include <limits>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "kidb.h"
+#include "kidebuglog.h"
+#include "utils.h"
+#include "zamoc.h"
+
+// One row of an action table: the action runs when the version before the upgrade is below
+// orgVersion, or always when orgVersion is 0. A null pFuncUpdate ends the table.
+typedef struct _camveld_upgrader_ {
+  uint32_t orgVersion;
+  int32_t (*pFuncUpdate)();
+} UPD_LIST;
+
+// The directory whose capability files are upgraded; empty when there is none.
+static std::string gstrRemoteCapDir;
+
+static int KiAtoi(const char* szText) {
+  if (szText == nullptr) {
+    return 0;
+  }
+  constexpr long MIN = std::numeric_limits<int32_t>::min();
+  constexpr long MAX = std::numeric_limits<int32_t>::max();
+  return static_cast<int>(std::clamp(strtol(szText, nullptr, 10), MIN, MAX));
+}
+
+// --- What the actions share ---
+
+// Runs strSqlCmd as one transaction on the system database. A failure is logged under the calling
+// action's own line and name, which the defaults take from the call. Returns 0 or -1.
+static int RunSql(const std::string& strSqlCmd, DBResult_tag** ppResult = nullptr,
+                  int LineNo = __builtin_LINE(), const char* szFunc = __builtin_FUNCTION()) {
+  if (KiDB::Execute(KiDB::DBI_SYSTEM, strSqlCmd, ppResult, false) != 0) {
+    KiPrintf(KI_LOG, nullptr, nullptr, __FILE__, LineNo, szFunc,
+             "KiDBExecute command (%s) error.\n", strSqlCmd.c_str());
+    return -1;
+  }
+  return 0;
+}
+
+// Runs each statement as a transaction of its own and stops at the first that fails: the ones
+// before it stay done.
+static int RunSteps(std::initializer_list<const char*> Statements, int LineNo = __builtin_LINE(),
+                    const char* szFunc = __builtin_FUNCTION()) {
+  for (const char* szStatement : Statements) {
+    if (RunSql(szStatement, nullptr, LineNo, szFunc) != 0) {
+      return -1;
+    }
+  }
+  return 0;
+}
+
+struct PROFILE_CHANGE {
+  const char* szSet;        // "UPDATE camera SET ... ", ending in a blank
+  const char* szCondition;  // " AND ...;", beginning with a blank
+};
+
+// Runs the changes, each narrowed by strConstraint, together as one transaction.
+static int RunProfile(const std::string& strConstraint,
+                      std::initializer_list<PROFILE_CHANGE> Changes, int LineNo = __builtin_LINE(),
+                      const char* szFunc = __builtin_FUNCTION()) {
+  std::string strSqlCmd;
+  for (const PROFILE_CHANGE& Change : Changes) {
+    strSqlCmd += Change.szSet + strConstraint + Change.szCondition;
+  }
+  return RunSql(strSqlCmd, nullptr, LineNo, szFunc);
+}
+
+// --- Camera rows, in the order of their table ---
+
+static int RenameAbusTvip62000Reso() {
+  return RunSteps({
+      "UPDATE camera SET resolution = '320x240',live_resolution = '320x240' "
+      "WHERE model = 'TVIP62000' AND resolution = 'QVGA'",
+      "UPDATE camera SET resolution = '640x480',live_resolution = '640x480' "
+      "WHERE model = 'TVIP62000' AND resolution = 'VGA'",
+      "UPDATE camera SET resolution = '1600x1200',live_resolution = '1600x1200' "
+      "WHERE model = 'TVIP62000' AND resolution = 'UXGA'",
+  });
+}
+
+static int UpdateCameraModelConfRenameSiemens() {
+  return RunSql("UPDATE camera SET vendor = 'SIEMENS' WHERE vendor = 'Siemens'");
+}
+
+static int UpdateCameraModelRenameForHIKVISION() {
+  constexpr int RenameModelNum = 11;
+  static const char* const strModelList[RenameModelNum][2] = {
+      // old name, new name
+      {"DS2CD864FWD-E", "DS-2CD864FWD-E"}, {"DS2CD853F-E", "DS-2CD853F-E"},
+      {"DS2CD764FWD-E", "DS-2CD764FWD-E"}, {"DS2CD783F-E", "DS-2CD783F-E"},
+      {"DS2CD883F-E", "DS-2CD883F-E"},     {"DS2CD7164-E", "DS-2CD7164-E"},
+      {"DS2CD7153-E", "DS-2CD7153-E"},     {"DS2CD8153F-E", "DS-2CD8153F-E"},
+      {"DS2CD8254F-EI", "DS-2CD8254F-EI"}, {"DS2CD8264FWD-EI", "DS-2CD8264FWD-EI"},
+      {"DS-2CD2612F-S", "DS-2CD2612F-IS"},
+  };
+  for (const auto& [szOld, szNew] : strModelList) {
+    char szCmd[512];
+    snprintf(szCmd, sizeof(szCmd),
+             "UPDATE camera SET model = '%s' WHERE vendor = 'HIKVISION' AND model = '%s'", szNew,
+             szOld);
+    if (RunSql(szCmd) != 0) {
+      return -1;
+    }
+  }
+  return 0;
+}
+
+static int UpdateFisheyeConfDlink6010L() {
+  return RunSql(
+      "UPDATE camera SET fov='Original View' "
+      "WHERE vendor='D-Link' AND model='DCS-6010L' AND fov=''");
+}
+
+static int UpdateFisheyeConfMobotixQ24PixordNd636() {
+  return RunSteps({
+      "UPDATE camera SET fov='Original View' "
+      "WHERE vendor='MOBOTIX' AND model='Q24M-Sec' AND fov=''",
+      "UPDATE camera SET fov='Original View' "
+      "WHERE vendor='PIXORD' AND model='ND636E' AND fov=''",
+  });
+}
+
+static int UpdateFisheyeConfPanasonic438() {
+  return RunSteps({
+      "UPDATE camera SET fov='1.3M Original View [4:3]' "
+      "WHERE vendor='Panasonic-iPro' AND model='WV-SF438' AND fov='1.3M Fisheye [4:3]'",
+      "UPDATE camera SET fov='3M Original View [4:3]' "
+      "WHERE vendor='Panasonic-iPro' AND model='WV-SF438' AND fov='3M Fisheye [4:3]'",
+  });
+}
+
+static int RenameLeveloneFCS1141ModelName() {
+  return RunSql("UPDATE camera SET model = 'FCS-1141(NTSC)' WHERE model = 'FCS-1141'");
+}
+
+static int UpdateFisheyeConfAxisM3007() {
+  return RunSql(
+      "UPDATE camera SET channel='Original View' "
+      "WHERE vendor='AXIS' AND channel='1' "
+      "AND (model='M3007' OR model='M3007-P' OR model='M3007-PV')");
+}
+
+static int UpdateMultiLensMobotixD14M12() {
+  return RunSql(
+      "UPDATE camera SET fov='Left Lens' "
+      "WHERE vendor='MOBOTIX' AND fov='' "
+      "AND (model='D14D-Sec-DNight' OR model='M12D-Sec-DNight')");
+}
+
+static int UpdateToshibaIKWD01AAndIKWB70AReso() {
+  return RunSql(
+      "UPDATE camera SET resolution='352x240' "
+      "WHERE vendor='TOSHIBA' AND (model='IK-WD01A' OR model='IK-WB70A') "
+      "AND resolution='320x240';"
+      "UPDATE camera SET live_resolution='352x240' "
+      "WHERE vendor='TOSHIBA' AND (model='IK-WD01A' OR model='IK-WB70A') "
+      "AND live_resolution='320x240';"
+      "UPDATE camera SET mobile_resolution='352x240' "
+      "WHERE vendor='TOSHIBA' AND (model='IK-WD01A' OR model='IK-WB70A') "
+      "AND mobile_resolution='320x240';");
+}
+
+static int UpdateTrendNetAdoFmt() {
+  return RunSql(
+      "UPDATE camera SET audio_format=2 "
+      "WHERE vendor='TRENDNet' AND (model='TV-IP312WN' OR model='TV-IP312W' OR model='TV-IP312' "
+      "OR model='TV-IP422W' OR model='TV-IP422' OR model='TV-IP262P' OR model='TV-IP262PI')");
+}
+
+static int UpdateFisheyeCamStreamNo() {
+  return RunSql(
+      "UPDATE camera SET rec_stream_no=1 "
+      "WHERE vendor='Vivotek' AND rec_stream_no=0 "
+      "AND (model='FE8171V' OR model='FE8172' OR model='FE8172V' OR model = 'FE8173');"
+      "UPDATE camera SET live_stream_no=2 "
+      "WHERE vendor='Vivotek' AND live_stream_no=0 "
+      "AND (model='FE8171V' OR model='FE8172' OR model='FE8172V' OR model = 'FE8173');"
+      "UPDATE camera SET rec_stream_no=1 "
+      "WHERE vendor='PIXORD' AND rec_stream_no=0 "
+      "AND (model='PB670' OR model='PB670E' OR model='PD637' OR model = 'PD637E');"
+      "UPDATE camera SET live_stream_no=1 "
+      "WHERE vendor='PIXORD' AND live_stream_no=0 "
+      "AND (model='PB670' OR model='PB670E' OR model='PD637' OR model = 'PD637E');");
+}
+
+static int UpdatePanasonicRTSPProtocol() {
+  return RunSql(
+      "UPDATE camera SET rtsp_protocol=1 "
+      "WHERE vendor='Panasonic' AND (model='BB-HCM527' OR model='BL-C111' OR model='BL-C131' "
+      "OR model='BB-HCM715' OR model='BB-HCM735' OR model='BB-HCM515' OR model='BB-HCM547') "
+      "AND rtsp_protocol <> 1");
+}
+
+static int UpdateGrandstreamGXV36Series() {
+  return RunSql(
+      "UPDATE camera SET rec_stream_no=1 "
+      "WHERE vendor='Grandstream' AND (model='GXV3651_FHD' OR model='GXV3662_FHD') "
+      "AND rec_stream_no=0;"
+      "UPDATE camera SET live_stream_no=1 "
+      "WHERE vendor='Grandstream' AND (model='GXV3651_FHD' OR model='GXV3662_FHD') "
+      "AND live_stream_no=0;"
+      "UPDATE camera SET mobile_stream_no=1 "
+      "WHERE vendor='Grandstream' AND (model='GXV3651_FHD' OR model='GXV3662_FHD') "
+      "AND mobile_stream_no=0;"
+      "UPDATE camera SET resolution='1920x1080' "
+      "WHERE vendor='Grandstream' "
+      "AND (model='GXV3651_FHD' OR model='GXV3662_FHD' OR model='GXV3672_FHD') "
+      "AND video_type=3 AND resolution='1920x1088';"
+      "UPDATE camera SET live_resolution='1920x1080' "
+      "WHERE vendor='Grandstream' "
+      "AND (model='GXV3651_FHD' OR model='GXV3662_FHD' OR model='GXV3672_FHD') "
+      "AND video_type=3 AND live_resolution='1920x1088';"
+      "UPDATE camera SET mobile_resolution='1920x1080' "
+      "WHERE vendor='Grandstream' "
+      "AND (model='GXV3651_FHD' OR model='GXV3662_FHD' OR model='GXV3672_FHD') "
+      "AND video_type=3 AND mobile_resolution='1920x1088';");
+}
+
+static int UpdateSonyGen5MDParam() {
+  return RunSql(
+      "UPDATE camera SET motion_sensitivity=100-motion_threshold, motion_threshold=0 "
+      "WHERE vendor='Sony' AND model='SNC-CH210' AND motion_threshold > 0");
+}
+
+static int UpdateBoschVJR811IWCVTvStandard() {
+  return RunSql(
+      "UPDATE camera SET tv_standard=1 "
+      "WHERE vendor='BOSCH' AND model='VJR-811-IWCV' AND tv_standard=0");
+}
+
+static int UpdatePanasonicSFN631L() {
+  return RunSql(
+      "UPDATE camera SET osd_position=2 "
+      "WHERE vendor='Panasonic-iPro' AND model='WV-SFN631L' AND osd_position<>6");
+}
+
+// The bit rate of a stream stands before its resolution: the condition of both is the old
+// resolution.
+static int UpdateDAHUASD4XC212S() {
+  const std::string strConstraint =
+      "WHERE vendor='DAHUA' "
+      "AND (model='SD40212S-HN' OR model='SD42212S-HN' OR model='SD42C212S-HN')";
+  return RunProfile(
+      strConstraint,
+      {
+          {"UPDATE camera SET rec_cbr_bitrate=2048, fps_2=10  ",
+           " AND (resolution='1280x960' OR resolution='640x480') AND rec_bitrate_ctrl=2;"},
+          {"UPDATE camera SET resolution='1280x720' ",
+           " AND (resolution='1280x960' OR resolution='640x480');"},
+          {"UPDATE camera SET live_cbr_bitrate=2048, live_fps=10 ",
+           " AND (live_resolution='1280x960' OR live_resolution='640x480')"
+           " AND live_bitrate_ctrl=2;"},
+          {"UPDATE camera SET live_resolution='1280x720' ",
+           " AND (live_resolution='1280x960' OR live_resolution='640x480');"},
+          {"UPDATE camera SET mobile_cbr_bitrate=2048, mobile_fps=10 ",
+           " AND (mobile_resolution='1280x960' OR mobile_resolution='640x480')"
+           " AND mobile_bitrate_ctrl=2;"},
+          {"UPDATE camera SET mobile_resolution='1280x720' ",
+           " AND (mobile_resolution='1280x960' OR mobile_resolution='640x480');"},
+      });
+}
+
+static int UpdateWVSC385() {
+  const std::string strConstraint = "WHERE vendor='Panasonic-iPro' AND model='WV-SC385'";
+  return RunProfile(
+      strConstraint,
+      {
+          {"UPDATE camera SET fov='16:9', "
+           "live_stream_no=1, rec_stream_no=1, mobile_stream_no=1, ui_stream_no='1,1,1' ",
+           " AND (video_type=1);"},
+          {"UPDATE camera SET fov='4:3 (VGA)', "
+           "live_stream_no=2, rec_stream_no=2, mobile_stream_no=2, ui_stream_no='2,2,2' ",
+           " AND (video_type=2);"},
+          {"UPDATE camera SET fov='16:9', "
+           "live_stream_no=2, rec_stream_no=2, mobile_stream_no=2, ui_stream_no='2,2,2' ",
+           " AND (video_type=3);"},
+      });
+}
+
+static int UpdateTRENDNetIP311PI() {
+  const std::string strConstraint = "WHERE vendor='TRENDNet' AND model='TV-IP311PI'";
+  return RunProfile(
+      strConstraint,
+      {
+          {"UPDATE camera SET "
+           "live_stream_no=1, rec_stream_no=1, mobile_stream_no=1, ui_stream_no='1,1,1' ",
+           " AND video_type=3 AND rec_stream_no=0;"},
+          {"UPDATE camera SET "
+           "live_stream_no=2, rec_stream_no=2, mobile_stream_no=2, ui_stream_no='2,2,2' ",
+           " AND video_type=1 AND rec_stream_no=0;"},
+          {"UPDATE camera SET "
+           "rec_cbr_bitrate=12288, live_cbr_bitrate=12288, mobile_cbr_bitrate=12288 ",
+           " AND rec_cbr_bitrate>12288 AND video_type=3;"},
+      });
+}
+
+static int UpdatePanasoniciPro2Panasonic() {
+  return RunSql("UPDATE camera SET vendor='Panasonic' WHERE vendor='Panasonic-iPro';");
+}
+
+static int RenameFoscamFI9828PModelName() {
+  return RunSql("UPDATE camera SET model = 'FI9828P V2' WHERE model = 'FI9828P'");
+}
+
+static int UpdateYCamBulletHDCodec() {
+  return RunSql(
+      "UPDATE camera SET video_type=3 "
+      "WHERE vendor='Y-CAM' AND model='BULLET HD' AND video_type=2;");
+}
+
+static int UpdateHjtICZX23Model() {
+  return RunSql("UPDATE camera SET model='ICZX230' WHERE vendor='HJT' AND model='ICZX23';");
+}
+
+static int UpdateSharpLZ0P432Model() {
+  return RunSql("UPDATE camera SET model='LZ0P432' WHERE vendor='SHARP' AND model='LZ0P432B';");
+}
+
+static int UpdateSharpModelNames() {
+  return RunSql(
+      "UPDATE camera SET model='LZ0P436' WHERE vendor='SHARP' AND model='LZ0P436B';"
+      "UPDATE camera SET model='LZ0P421' WHERE vendor='SHARP' AND model='LZ0P421A';"
+      "UPDATE camera SET model='LZ0P422' WHERE vendor='SHARP' AND model='LZ0P422A';"
+      "UPDATE camera SET model='QG-B20C' WHERE vendor='SHARP' AND model='QB-G20C';");
+}
+
+static int UpdateTpLinkNC450() {
+  return RunSql(
+      "UPDATE camera SET firmware='1.20' "
+      "WHERE vendor='TP-LINK' AND model='NC450' AND firmware='';");
+}
+
+// connected_wire is a row of bytes with small values, not of digits.
+static std::string AddSecondOutput(std::string strConnectedWire) {
+  const size_t Len = strConnectedWire.size();
+  if (Len < 2) {
+    return "\2\1";
+  }
+  strConnectedWire[0] = 2;
+  if (Len > 2 && strConnectedWire[2] == 2) {
+    strConnectedWire[2] = 1;
+  }
+  return strConnectedWire;
+}
+
+// Each statement is a transaction of its own. Every run adds one more "DO 2" row to each camera:
+// the version threshold is what keeps the action from running again.
+static int UpdateAxisA8105E() {
+  DBResult_tag* pFetched = nullptr;
+  if (RunSql("SELECT id,id_on_rec_server,owner_ds_id,connected_wire from camera "
+             "WHERE vendor='AXIS' AND model='A8105-E';",
+             &pFetched) != 0) {
+    return -1;
+  }
+  const std::unique_ptr<DBResult_tag, decltype(&KiDB::KiDBFreeResult)> pResult(
+      pFetched, KiDB::KiDBFreeResult);
+  const auto Rows = static_cast<int>(ZAMODBNumRows(pResult.get()));
+  if (Rows <= 0) {
+    KiPrintf(KI_LOG, nullptr, nullptr, __FILE__, __LINE__, __func__,
+             "There's no info in camera table.\n");
+    return 0;
+  }
+  for (int Idx = 0; Idx < Rows; ++Idx) {
+    DBRow Row = 0;
+    if (ZAMODBFetchRow(pResult.get(), &Row) != 0) {
+      KiPrintf(KI_LOG, nullptr, nullptr, __FILE__, __LINE__, __func__,
+               "Failed to get camera info.\n");
+      return -1;
+    }
+    const char* szWire = ZAMODBFetchField(pResult.get(), Row, "connected_wire");
+    const std::string strConnectedWire = AddSecondOutput(szWire == nullptr ? "" : szWire);
+    const int Id = KiAtoi(ZAMODBFetchField(pResult.get(), Row, "id"));
+    const int IdOnRecServer = KiAtoi(ZAMODBFetchField(pResult.get(), Row, "id_on_rec_server"));
+    const int OwnerDsId = KiAtoi(ZAMODBFetchField(pResult.get(), Row, "owner_ds_id"));
+
+    if (RunSql("UPDATE camera SET connected_wire='" + strConnectedWire +
+               "' WHERE vendor='AXIS' AND model='A8105-E' AND id=" + itos(Id) + ";") != 0) {
+      return -1;
+    }
+    if (RunSql("INSERT INTO camdeviceoutput (cam_id, cam_id_on_rec_server, owner_ds_id, type, idx, "
+               "name) VALUES (" +
+               itos(Id) + ", " + itos(IdOnRecServer) + ", " + itos(OwnerDsId) +
+               ", 1, 1, 'DO 2');") != 0) {
+      return -1;
+    }
+  }
+  return 0;
+}
+
+static int UpdateFoscam3MReso() {
+  return RunSql(
+      "UPDATE camera SET resolution='2304x1296' "
+      "WHERE vendor='FOSCAM' AND model IN ('FI9901EP','R4') AND resolution='2048x1536';"
+      "UPDATE camera SET live_resolution='2304x1296' "
+      "WHERE vendor='FOSCAM' AND model IN ('FI9901EP','R4') AND live_resolution='2048x1536';"
+      "UPDATE camera SET mobile_resolution='2304x1296' "
+      "WHERE vendor='FOSCAM' AND model IN ('FI9901EP','R4') AND mobile_resolution='2048x1536';");
+}
+
+static int RenameASUSAiCamNightViewModel() {
+  return RunSql(
+      "UPDATE camera SET model='AiCam 2' WHERE vendor='ASUS' AND model='AiCam NightView';");
+}
+
+static int UpdateReolinkRLC411And423Series() {
+  return RunSql(
+      "UPDATE camera SET fov='4MP' "
+      "WHERE vendor='Reolink' AND model IN ('RLC-423','RLC-411','RLC-411S','RLC-411WS') "
+      "AND fov='';");
+}
+
+// --- Capability files ---
+
+// The value of strKey, or nothing when there is none or it cannot be read.
+static std::string GetConfKeyValue(const std::string& strFilePath, const std::string& strKey) {
+  char szValue[512] = "";
+  if (ZAMOCFileGetKeyValue(strFilePath.c_str(), strKey.c_str(), szValue, sizeof(szValue), 0) <= 0) {
+    return "";
+  }
+  return szValue;
+}
+
+struct DirCloser {
+  void operator()(DIR* pDir) const { closedir(pDir); }
+};
+
+// Calls pUpgradeFile for every entry of the capability directory, whatever its type or name, until
+// one fails. Returns -1 when one did or when there is no capability directory. One that cannot be
+// opened or read holds nothing to do.
+static int ForEachCapFile(int (*pUpgradeFile)(const std::string& strFilePath)) {
+  if (gstrRemoteCapDir.empty()) {
+    return -1;
+  }
+  char szCapPath[512];
+  snprintf(szCapPath, sizeof(szCapPath), "%s", gstrRemoteCapDir.c_str());
+  const std::unique_ptr<DIR, DirCloser> pDir(opendir(szCapPath));
+  if (pDir == nullptr) {
+    return 0;
+  }
+  while (const dirent* pEntry = readdir(pDir.get())) {
+    const std::string strName = pEntry->d_name;
+    if (strName == "." || strName == "..") {
+      continue;
+    }
+    if (pUpgradeFile(szCapPath + ("/" + strName)) != 0) {
+      return -1;
+    }
+  }
+  return 0;
+}
+
+// A file's changes are made in one replacement: a run that is cut off between the marker and the
+// axes would let the next one take a continuous axis for a stepping one.
+static int UpgradeOnvifConfForPtzContinuousMove() {
+  return ForEachCapFile([](const std::string& strFilePath) {
+    std::vector<ZAMOCKeyChange> Changes;
+    const bool blPtzContinuousMove = GetConfKeyValue(strFilePath, "ptz_continuous_move") == "yes";
+    if (blPtzContinuousMove) {
+      Changes.push_back({"ptz_continuous_move", nullptr, nullptr});
+    }
+    for (const char* szAxis : {"pan", "tilt", "zoom"}) {
+      if (GetConfKeyValue(strFilePath, szAxis) == "yes") {
+        Changes.push_back({szAxis, blPtzContinuousMove ? "continuous" : "step", "%s= %s\n"});
+      }
+    }
+    if (Changes.empty()) {
+      return 0;
+    }
+    const int Err = ZAMOCFileChangeKeys(strFilePath.c_str(), Changes.data(), Changes.size());
+    return blPtzContinuousMove ? Err : 0;  // only the marker's removal has to succeed
+  });
+}
+
+static int UpgradeOnvifConfForContinuousPtzSpeed() {
+  return ForEachCapFile([](const std::string& strFilePath) {
+    if (!GetConfKeyValue(strFilePath, "ptz_speed_max").empty()) {
+      return 0;
+    }
+    const bool blSupportPtzSpeed = GetConfKeyValue(strFilePath, "pan") == "continuous" ||
+                                   GetConfKeyValue(strFilePath, "tilt") == "continuous";
+    if (blSupportPtzSpeed) {
+      ZAMOCFileSetKeyValue(strFilePath.c_str(), "ptz_speed_max", "1", "%s = %s\n");
+    }
+    return 0;
+  });
+}
+
+// --- The action tables, by ascending threshold ---
+
+static const UPD_LIST grgCamveldDBUpgradeAction[] = {
+    {83, RenameAbusTvip62000Reso},
+    {86, UpdateCameraModelConfRenameSiemens},
+    {301, UpdateCameraModelRenameForHIKVISION},
+    {303, UpdateFisheyeConfDlink6010L},
+    {304, UpdateFisheyeConfMobotixQ24PixordNd636},
+    {309, UpdateFisheyeConfPanasonic438},
+    {309, RenameLeveloneFCS1141ModelName},
+    {310, UpdateFisheyeConfAxisM3007},
+    {323, UpdateMultiLensMobotixD14M12},
+    {359, UpdateToshibaIKWD01AAndIKWB70AReso},
+    {365, UpdateTrendNetAdoFmt},
+    {418, UpdateFisheyeCamStreamNo},
+    {421, UpdatePanasonicRTSPProtocol},
+    {435, UpdateGrandstreamGXV36Series},
+    {435, UpdateSonyGen5MDParam},
+    {500, UpdateBoschVJR811IWCVTvStandard},
+    {536, UpdatePanasonicSFN631L},
+    {564, UpdateDAHUASD4XC212S},
+    {582, UpdateWVSC385},
+    {612, UpdateTRENDNetIP311PI},
+    {802, UpdatePanasoniciPro2Panasonic},
+    {823, RenameFoscamFI9828PModelName},
+    {827, UpdateYCamBulletHDCodec},
+    {1204, UpdateHjtICZX23Model},
+    {2073, UpdateSharpLZ0P432Model},
+    {2321, UpdateSharpModelNames},
+    {2350, UpdateTpLinkNC450},
+    {2401, UpdateAxisA8105E},
+    {2428, UpdateFoscam3MReso},
+    {2473, RenameASUSAiCamNightViewModel},
+    {2475, UpdateReolinkRLC411And423Series},
+    {0, nullptr},
+};
+
+static const UPD_LIST grgCamveldRemoteCapUpgradeAction[] = {
+    {68, UpgradeOnvifConfForPtzContinuousMove},
+    {80, UpgradeOnvifConfForContinuousPtzSpeed},
+    {0, nullptr},
+};
+
+static int DoAction(const UPD_LIST* pAction, uint32_t orgVer, int Idx) {
+  const UPD_LIST& Row = pAction[Idx];
+  if (Row.orgVersion != 0 && orgVer >= Row.orgVersion) {
+    return 0;
+  }
+  const int Err = Row.pFuncUpdate();
+  return Err;
+}
+
+// Runs the selected rows in order. A failing action does not stop the ones after it. Returns -1
+// when any failed, else 0.
+static int DoActions(const UPD_LIST* pAction, uint32_t orgVer) {
+  int Err = 0;
+  for (int Idx = 0; pAction[Idx].pFuncUpdate != nullptr; ++Idx) {
+    if (DoAction(pAction, orgVer, Idx) < 0) {
+      Err = -1;
+    }
+  }
+  return Err;
+}
+
+static std::string GetDefaultCapDir() {
+  struct stat Stat;
+  if (stat("/var/packages/Camveld/target/@camveld", &Stat) != 0 || !S_ISDIR(Stat.st_mode)) {
+    return "";
+  }
+  return "/var/packages/Camveld/target/@camveld/@KICapInfo";
+}
+
+static void Usage() {
+  ZAMOCCopyright();
+  puts("Usage:\ntesselupgrader {pre-upgrade-version}|{--updateCap remote-cap-dir}");
+}
+
+int main(int argc, char* argv[]) {
+  int Err = 0;
+  if (argc == 2) {
+    const auto orgVer = static_cast<uint32_t>(KiAtoi(argv[1]));
+    KiPrintf(KI_LOG, nullptr, nullptr, __FILE__, __LINE__, __func__,
+             "TESSEL pre-upgrade version: %u\n", orgVer);
+    Err = DoActions(grgCamveldDBUpgradeAction, orgVer);
+    gstrRemoteCapDir = GetDefaultCapDir();
+    if (DoActions(grgCamveldRemoteCapUpgradeAction, orgVer) < 0) {
+      Err = -1;
+    }
+    return Err;
+  }
+  if (argc == 3 && strcmp(argv[1], "--updateCap") == 0) {
+    gstrRemoteCapDir = argv[2];
+    return DoActions(grgCamveldRemoteCapUpgradeAction, 0);
+  }
+  Usage();
+  return 1;
+}
