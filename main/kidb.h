@@ -7,11 +7,11 @@
 
 namespace KiDB {
 
-enum DB_INSTANCE : int {
+typedef enum __DB_INSTANCE : int {
   DBI_SYSTEM = 0,     // /var/packages/Camveld/target/system.db
   DBI_RECORDING = 1,  // /var/services/camveld/recording.db
   DBI_CNT = 2,        // how many there are, not a database
-};
+} DB_INSTANCE;
 
 // Connects to a database, runs strCommand between "BEGIN;" and ";COMMIT;", and closes. Returns 0,
 // or -1 after logging why: no connection, or a statement failed, and then nothing of the text is

@@ -19,6 +19,7 @@
 namespace {
 
 constexpr int DIR_LOCK_TIMEOUT_SEC = 10;
+constexpr off_t MAX_FILE_SIZE = off_t{16} * 1024 * 1024;
 constexpr const char* BLANKS = " \t";
 constexpr const char* TMP_NAME = "/.tesselupgrader.tmp";
 
@@ -94,14 +95,27 @@ bool IsTmpFile(const std::string& strFile) {
          strFile.compare(strFile.size() - strEnd.size(), strEnd.size(), strEnd) == 0;
 }
 
+// 0 when it can be a capability file, else -1 with errno.
+int CheckFile(const struct stat& Stat) {
+  if (!S_ISREG(Stat.st_mode)) {
+    errno = EINVAL;
+    return -1;
+  }
+  if (Stat.st_size > MAX_FILE_SIZE) {
+    errno = EFBIG;
+    return -1;
+  }
+  return 0;
+}
+
 // Opening anything but a regular file could hang (a FIFO) or have effects (a device), so it is
-// looked at first, and again once open. Null with errno when it cannot be opened or is not one.
+// looked at first, and again once open. Null with errno when it cannot be a capability file.
 File OpenRegular(const char* szFile) {
   struct stat Stat;
-  if (stat(szFile, &Stat) != 0) {
+  if (stat(szFile, &Stat) != 0 || CheckFile(Stat) != 0) {
     return nullptr;
   }
-  if (!S_ISREG(Stat.st_mode) || IsTmpFile(szFile)) {
+  if (IsTmpFile(szFile)) {
     errno = EINVAL;
     return nullptr;
   }
@@ -112,8 +126,9 @@ File OpenRegular(const char* szFile) {
   File pFile(fdopen(Fd, "r"));
   if (pFile == nullptr) {
     close(Fd);
-  } else if (fstat(Fd, &Stat) != 0 || !S_ISREG(Stat.st_mode)) {
-    errno = EINVAL;
+    return nullptr;
+  }
+  if (fstat(Fd, &Stat) != 0 || CheckFile(Stat) != 0) {
     return nullptr;
   }
   return pFile;
@@ -132,7 +147,7 @@ class LineReader {
   // False at the end and on a failure, which Failed() tells apart.
   bool Next(std::string* pLine) {
     const ssize_t Len = getline(&m_pLine, &m_Size, m_pFile);
-    if (Len < 0) {
+    if (Len < 0 || ferror(m_pFile) != 0) {
       return false;
     }
     pLine->assign(m_pLine, static_cast<size_t>(Len));
@@ -176,24 +191,20 @@ std::string ValueOf(std::string strLine) {
   return strValue;
 }
 
-// A key that would be read back as another one, or as none, cannot be written.
-bool IsKey(const std::string& strKey) {
-  return !strKey.empty() && strKey[0] != '#' && strKey == TrimBlanks(strKey) &&
-         strKey.find_first_of("=\r\n") == std::string::npos;
-}
-
-// Fills the two "%s" of strFormat. Returns nothing when it has not exactly two, or when a line
-// break in the value would make a line of its own.
+// Fills the two "%s" of strFormat. Returns nothing when it has not exactly two, or when they do not
+// make one line of that key.
 std::string FormatLine(const std::string& strFormat, const std::string& strKey,
                        const std::string& strValue) {
   const size_t Key = strFormat.find("%s");
   const size_t Value = Key == std::string::npos ? Key : strFormat.find("%s", Key + 2);
-  if (Value == std::string::npos || std::count(strFormat.begin(), strFormat.end(), '%') != 2 ||
-      strValue.find_first_of("\r\n") != std::string::npos) {
+  if (Value == std::string::npos || std::count(strFormat.begin(), strFormat.end(), '%') != 2) {
     return "";
   }
-  return strFormat.substr(0, Key) + strKey + strFormat.substr(Key + 2, Value - Key - 2) + strValue +
-         strFormat.substr(Value + 2);
+  std::string strLine = strFormat.substr(0, Key) + strKey +
+                        strFormat.substr(Key + 2, Value - Key - 2) + strValue +
+                        strFormat.substr(Value + 2);
+  const bool blOneLine = strLine.find('\n') == strLine.size() - 1;
+  return blOneLine && KeyOf(strLine) == strKey ? strLine : "";
 }
 
 // Reads up to the first line of strKey. Returns 1 with its value, 0 when there is none, -1 on
@@ -253,9 +264,9 @@ int CopyChanged(FILE* pOld, FILE* pNew, std::vector<CHANGE> Changes) {
     }
     if (blLineOpen) {
       fputc('\n', pNew);
+      blLineOpen = false;
     }
     fwrite(Change.strNewLine.data(), 1, Change.strNewLine.size(), pNew);
-    blLineOpen = Change.strNewLine.back() != '\n';
   }
   return fflush(pNew) == 0 && ferror(pNew) == 0 ? 0 : -1;
 }
@@ -352,7 +363,7 @@ int ZAMOCFileChangeKeys(const char* szFile, const ZAMOCKeyChange* pChanges, size
     if (pChange->szValue != nullptr && pChange->szFormat != nullptr) {
       Change.strNewLine = FormatLine(pChange->szFormat, Change.strKey, pChange->szValue);
     }
-    if (!IsKey(Change.strKey) || Change.strNewLine.empty() != (pChange->szValue == nullptr)) {
+    if (Change.strKey.empty() || Change.strNewLine.empty() != (pChange->szValue == nullptr)) {
       errno = EINVAL;
       return ReportFailure(szFile, "change of a key");
     }
@@ -375,7 +386,7 @@ int ZAMOCFileRemoveKey(const char* szFile, const char* szKey) {
   const File pFile = OpenRegular(szFile);
   const int Found = pFile == nullptr ? -1 : FindKey(pFile.get(), szKey, &strValue);
   if (Found <= 0) {
-    return Found;
+    return Found == 0 ? 0 : ReportFailure(szFile, "read");
   }
   const ZAMOCKeyChange Change = {szKey, nullptr, nullptr};
   return ZAMOCFileChangeKeys(szFile, &Change, 1) == 0 ? 1 : -1;

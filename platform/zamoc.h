@@ -5,11 +5,13 @@
 // quotes around the value. Of several lines with one key the first counts. A line that starts with
 // '#' or has no '=' is never a key.
 //
-// Only regular files, or links to them, are ever opened; anything else holds no keys. A changed
-// file is replaced as a whole: whatever happens, the path leads to the old or to the new content,
-// with the owner, group and mode it had, and the new one is on stable storage before a call returns
-// success. Callers that change files of one directory, in any process, take turns. Why a change
-// failed goes to syslog at LOG_ERR. Any thread may call any of these.
+// Only regular files of up to 16 MiB, or links to them, are ever opened; anything else holds no
+// keys. A changed file is replaced as a whole: whatever happens, the path leads to the old or to
+// the new content, with the owner, group and mode it had, and the new one is on stable storage
+// before a call returns success. Until it gets its name it is .tesselupgrader.tmp beside the file;
+// one that a killed process leaves holds no keys, and goes with the next change in its directory.
+// Callers that change files of one directory, in any process, take turns and wait up to ten seconds
+// for theirs. Why a change failed goes to syslog at LOG_ERR. Any thread may call any of these.
 #pragma once
 
 #include <cstddef>
@@ -22,13 +24,14 @@ int ZAMOCFileGetKeyValue(const char* szFile, const char* szKey, char* szValue, s
 
 // Sets szKey to szValue in an existing file: its first line is replaced by szFormat with its two
 // "%s" filled, further lines of the key are dropped, a new key is appended. All other bytes of the
-// file stay. Returns 0, or -1 with the file as it was: also for a key or value that a line cannot
-// hold, and for a format without two "%s".
+// file stay. Returns 0, or -1 with the file as it was, unless all that failed was syncing the
+// directory behind the replacement. It fails also when key, value and format do not make one line,
+// closed by a line feed, of that key.
 int ZAMOCFileSetKeyValue(const char* szFile, const char* szKey, const char* szValue,
                          const char* szFormat);
 
 // Takes every line of szKey out of the file. Returns 1 when it did, 0 when there was none and the
-// file was left untouched, -1 on failure with the file as it was.
+// file was left untouched, -1 on failure, as above.
 int ZAMOCFileRemoveKey(const char* szFile, const char* szKey);
 
 // One change of a file: szKey is set to szValue in szFormat, or taken out when szValue is null.
@@ -39,7 +42,7 @@ struct ZAMOCKeyChange {
 };
 
 // Makes Count changes of different keys, each as the calls above would, in one replacement of the
-// file: all of them are made or none. Returns 0, or -1 with the file as it was.
+// file: all of them are made or none. Returns 0, or -1 on failure, as above.
 int ZAMOCFileChangeKeys(const char* szFile, const ZAMOCKeyChange* pChanges, size_t Count);
 
 // Writes one line with the tool's name and version to standard output.

@@ -26,6 +26,9 @@ struct DBResult_tag {
 namespace {
 
 constexpr int BUSY_TIMEOUT_MSEC = 5000;
+// What one statement may have to take back is kept in memory up to this size, which is several
+// times an appliance's cameras; beyond it SQLite uses a temporary file.
+constexpr int STATEMENT_JOURNAL_BYTES = 1024 * 1024;
 
 struct StatementFinalizer {
   void operator()(sqlite3_stmt* pStatement) const { sqlite3_finalize(pStatement); }
@@ -107,6 +110,10 @@ DBConnect* ZAMODBConnect(const char* /*szHost*/, const char* /*szUser*/, const c
   if (szDBName == nullptr || !IsRegularFile(szDBName)) {
     return nullptr;
   }
+  static const int Configured =
+      sqlite3_config(SQLITE_CONFIG_STMTJRNL_SPILL, STATEMENT_JOURNAL_BYTES);
+  static_cast<void>(
+      Configured);  // too late, and harmless, where the process has used SQLite before
   auto pConn = std::make_unique<DBConnect>();
   if (sqlite3_open_v2(szDBName, &pConn->m_pDb, SQLITE_OPEN_READWRITE, nullptr) != SQLITE_OK) {
     ReportFailure(pConn->m_pDb, szDBName, sqlite3_errmsg(pConn->m_pDb));
