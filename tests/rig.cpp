@@ -1,11 +1,9 @@
 #include "rig.h"
 
 #include <linux/magic.h>
-#include <sqlite3.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <sys/vfs.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cstdio>
@@ -29,90 +27,33 @@ void WriteFile(const std::string& strPath, const std::string& strContent) {
 }
 
 std::string Sql(const std::string& strDb, const std::string& strSqlCmd) {
-  sqlite3* pDb = nullptr;
-  std::string strRows;
-  char* szError = nullptr;
-  const auto AppendRow = [](void* pRows, int Columns, char** rgValue, char**) {
-    for (int Column = 0; Column < Columns; ++Column) {
-      static_cast<std::string*>(pRows)->append(rgValue[Column] ? rgValue[Column] : "");
-      static_cast<std::string*>(pRows)->push_back(Column + 1 < Columns ? '|' : '\n');
-    }
-    return 0;
-  };
-  sqlite3_open(strDb.c_str(), &pDb);
-  if (sqlite3_exec(pDb, strSqlCmd.c_str(), AppendRow, &strRows, &szError) != SQLITE_OK) {
-    ADD_FAILURE() << szError << " in " << strSqlCmd;
-  }
-  sqlite3_free(szError);
-  sqlite3_close(pDb);
-  return strRows;
+  const RUN Run = RunCommand("sqlite3 -bail " + strDb + " <<'SQL'\n" + strSqlCmd + "\nSQL");
+  EXPECT_EQ(Run.Status, 0) << Run.strOutput << " in " << strSqlCmd;
+  return Run.strOutput;
 }
 
-std::string DumpDb(const std::string& strDb) {
-  std::istringstream Columns(Sql(
-      strDb,
-      "SELECT m.name, group_concat('quote(\"'||c.name||'\")', '||'',''||') FROM sqlite_master m, "
-      "pragma_table_info(m.name) c WHERE m.type='table' GROUP BY m.name"));
-  std::string strDump;
-  for (std::string strTable, strList; std::getline(Columns, strTable, '|');) {
-    std::getline(Columns, strList);
-    strDump += Sql(strDb, "SELECT '" + strTable + ": '||" + strList + " FROM " + strTable);
+RUN RunCommand(const std::string& strCommand) {
+  RUN Run;
+  FILE* pOutput = popen(("exec 2>&1; " + strCommand).c_str(), "r");
+  for (int Byte; (Byte = getc(pOutput)) != EOF;) {
+    Run.strOutput.push_back(static_cast<char>(Byte));
   }
-  return strDump;
-}
-
-void CreateExampleDb(const std::string& strDb) {
-  Sql(strDb, ReadFile(TESSEL_SOURCE_DIR "/examples/appliance.sql"));
-}
-
-RUN RunCommand(std::vector<std::string> Args) {
-  std::vector<char*> rgArg;
-  for (std::string& strArg : Args) {
-    rgArg.push_back(strArg.data());
-  }
-  rgArg.push_back(nullptr);
-  int rgPipe[2];
-  EXPECT_EQ(pipe(rgPipe), 0);
-  const pid_t Pid = fork();
-  if (Pid == 0) {
-    dup2(rgPipe[1], STDOUT_FILENO);
-    dup2(rgPipe[1], STDERR_FILENO);
-    close(rgPipe[0]);
-    close(rgPipe[1]);
-    execvp(rgArg[0], rgArg.data());
-    perror(rgArg[0]);
-    _exit(127);
-  }
-  close(rgPipe[1]);
-  RUN Run = {0, ""};
-  char Buffer[4096];
-  for (ssize_t Len; (Len = read(rgPipe[0], Buffer, sizeof(Buffer))) > 0;) {
-    Run.strOutput.append(Buffer, static_cast<size_t>(Len));
-  }
-  close(rgPipe[0]);
-  int Status = 0;
-  waitpid(Pid, &Status, 0);
-  Run.Status = WIFSIGNALED(Status) ? 128 + WTERMSIG(Status) : WEXITSTATUS(Status);
+  Run.Status = WEXITSTATUS(pclose(pOutput));
   return Run;
 }
 
-RUN RunTool(const std::vector<std::string>& Args, const std::vector<std::string>& Wrapper) {
-  std::vector<std::string> Command = Wrapper;
-  if (strlen(TESSEL_EMULATOR) != 0) {
-    Command.emplace_back(TESSEL_EMULATOR);
-  }
-  Command.emplace_back(TESSEL_TOOL);
-  Command.insert(Command.end(), Args.begin(), Args.end());
-  return RunCommand(Command);
+RUN RunTool(const std::string& strArgs, const std::string& strWrapper) {
+  return RunCommand(strWrapper + " " TESSEL_EMULATOR " " TESSEL_TOOL " " + strArgs);
 }
 
 std::vector<std::string> LogLines() {
-  static const std::regex Prefix(R"(^[A-Z][a-z]{2} [ 123]\d \d\d:\d\d:\d\d(\.\d{3})? \[\d+\] )");
+  static const std::regex Prefix(
+      R"(^[A-Z][a-z]{2} [ 123]\d \d\d:\d\d:\d\d(\.\d{3})? \[\d+\] ([^:]*:)\d+:)");
   std::ifstream Log(LOG_FILE);
   std::vector<std::string> Lines;
   for (std::string strLine; std::getline(Log, strLine);) {
     EXPECT_TRUE(std::regex_search(strLine, Prefix)) << strLine;
-    Lines.push_back(std::regex_replace(strLine, Prefix, ""));
+    Lines.push_back(std::regex_replace(strLine, Prefix, "$2"));
   }
   return Lines;
 }

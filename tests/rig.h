@@ -15,27 +15,21 @@ constexpr const char* LOG_FILE = "/var/log/camveld/camveld.log";
 std::string ReadFile(const std::string& strPath);
 void WriteFile(const std::string& strPath, const std::string& strContent);
 
-// Runs an SQL text on a database and returns its rows, columns parted by '|', rows by line feeds.
-std::string Sql(const std::string& strDb, const std::string& strSqlCmd);
-
-// Every cell of every table, with its type.
-std::string DumpDb(const std::string& strDb);
-
-// Creates a database from examples/appliance.sql.
-void CreateExampleDb(const std::string& strDb);
-
 struct RUN {
-  int Status;  // exit status, or 128 plus the signal
-  std::string strOutput;
+  int Status;             // exit status, as a shell has it
+  std::string strOutput;  // of both streams
 };
 
-// Runs a command, with both of its output streams in strOutput.
-RUN RunCommand(std::vector<std::string> Args);
+// Runs a shell command.
+RUN RunCommand(const std::string& strCommand);
 
-// Runs the shipped tool, through strace or the like when Wrapper is given.
-RUN RunTool(const std::vector<std::string>& Args, const std::vector<std::string>& Wrapper = {});
+// Runs an SQL text with the sqlite3 shell and returns its rows, columns parted by '|'.
+std::string Sql(const std::string& strDb, const std::string& strSqlCmd);
 
-// The lines of the package log, without time and process id.
+// Runs the shipped tool, through strace or the like when strWrapper is given.
+RUN RunTool(const std::string& strArgs, const std::string& strWrapper = "");
+
+// The lines of the package log, without time, process id and line number.
 std::vector<std::string> LogLines();
 
 // Receives what is sent to /dev/log while it lives.
