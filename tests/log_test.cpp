@@ -6,7 +6,6 @@
 
 #include <cerrno>
 #include <chrono>
-#include <filesystem>
 #include <fstream>
 #include <map>
 #include <regex>
@@ -16,7 +15,6 @@
 #include "rig.h"
 #include "utils.h"
 
-using std::string;
 using std::chrono::milliseconds;
 using std::chrono::steady_clock;
 
@@ -54,7 +52,7 @@ TEST_F(Log, LineHasEachFieldInItsPlace) {
 TEST_F(Log, LostLinesGoToSyslog) {
   SyslogSocket Syslog;
   KiPrintf(static_cast<LOG_TYPE>(2), nullptr, nullptr, "f", 1, "Fn", "x\n");
-  std::filesystem::remove_all("/var/log/camveld");
+  fs::remove_all("/var/log/camveld");
   KiPrintf(KI_LOG, nullptr, nullptr, "f", 1, "Fn", "x\n");
   EXPECT_EQ(RunTool("2475").Status, 0);
   string strRecords;
@@ -64,7 +62,7 @@ TEST_F(Log, LostLinesGoToSyslog) {
   const string strRecord =
       "<11> libkimodule/lib/kidebuglog.cpp:LINE:KiPrintf(): open kilog file failed with errno ";
   EXPECT_EQ(strRecords, strRecord + "[22].\n" + strRecord + "[2].\n" + strRecord + "[2].\n");
-  EXPECT_FALSE(std::filesystem::exists("/var/log/camveld"));
+  EXPECT_FALSE(fs::exists("/var/log/camveld"));
 }
 
 TEST_F(Log, LinesOfTwoProcessesStayWhole) {

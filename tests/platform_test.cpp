@@ -6,7 +6,6 @@
 
 #include <chrono>
 #include <csignal>
-#include <filesystem>
 
 #include "kidb.h"
 #include "rig.h"
@@ -14,8 +13,6 @@
 #include "zamoc.h"
 #include "zamodb.h"
 
-namespace fs = std::filesystem;
-using std::string;
 using std::chrono::seconds;
 using std::chrono::steady_clock;
 
@@ -66,22 +63,9 @@ TEST_F(Database, ConnectsOnlyToAFileThatIsThereAndCanBeWritten) {
 }
 
 TEST_F(Database, RunsEachStatementUntilOneFails) {
-  const struct {
-    const char* szSqlCmd;
-    int Ret;
-    const char* szRows;
-  } rgCase[] = {
-      {"BEGIN;INSERT INTO t VALUES (2);;COMMIT;", 0, "1,2\n"},
-      {";; -- nothing\n ; INSERT INTO t VALUES (2)", 0, "1,2\n"},
-      {"", 0, "1\n"},
-      {"INSERT INTO t VALUES (2), (3); INSERT INTO t VALUES (13); DELETE FROM t", -1, "1,2,3\n"},
-      {"BEGIN; INSERT INTO t VALUES (2); INSERT INTO none VALUES (3); COMMIT;", -1, "1\n"},
-      {"INSERT INTO t VALUES (2); SELEC", -1, "1,2\n"},
-      {"BEGIN; INSERT INTO t VALUES (2)", -1, "1\n"},
-  };
-  for (const auto& Case : rgCase) {
-    EXPECT_EQ(Run(Case.szSqlCmd), Case.Ret) << Case.szSqlCmd;
-    EXPECT_EQ(Rows(), Case.szRows) << Case.szSqlCmd;
+  for (const Lines& Row : ReadTable("statements.tsv")) {
+    EXPECT_EQ(itos(Run(Row[0].c_str())), Row[1]) << Row[0];
+    EXPECT_EQ(Rows(), Row[2] + "\n") << Row[0];
     Sql(SYSTEM_DB, "DELETE FROM t WHERE n > 1");
   }
 }
@@ -179,18 +163,16 @@ TEST_F(Database, ExecuteReplacesBooleansAndHandsResultsOver) {
     KiDB::KiDBFreeResult(pResult);
     pResult = nullptr;
   }
-  EXPECT_EQ(KiDB::Execute(KiDB::DBI_SYSTEM, "SELECT 1", nullptr, true), 0);
-  EXPECT_EQ(KiDB::Execute(KiDB::DBI_SYSTEM, "SELECT 1; SELECT x", &pResult, false), -1);
+  EXPECT_EQ(KiDB::Execute(KiDB::DBI_SYSTEM, "SELECT 1; SELECT x", &pResult, true), -1);
   EXPECT_EQ(KiDB::Execute(KiDB::DBI_RECORDING, "SELECT 1", &pResult, false), -1);
   EXPECT_EQ(KiDB::Execute(KiDB::DBI_CNT, "SELECT 1", &pResult, false), -1);
   EXPECT_EQ(pResult, nullptr);
-  const string strReplaced = "kidb.cpp:ReplaceBoolForSqlite(): Got sql cmd with bool replaced: ";
-  const string strFailed = "kidb.cpp:Execute(): Failed to ";
-  const std::vector<string> Expected = {
-      strReplaced + "SELECT '" + strDigits + "' v",
-      strFailed + "execute db[0] cmd: BEGIN;SELECT 1; SELECT x;COMMIT;.",
-      strFailed + "connect to db[1, /var/services/camveld/recording.db].",
-      strFailed + "connect to db[2, ]."};
+  const Lines Expected = {
+      "kidb.cpp:ReplaceBoolForSqlite(): Got sql cmd with bool replaced: SELECT '" + strDigits +
+          "' v",
+      "kidb.cpp:Execute(): Failed to execute db[0] cmd: BEGIN;SELECT 1; SELECT x;COMMIT;.",
+      "kidb.cpp:Execute(): Failed to connect to db[1, /var/services/camveld/recording.db].",
+      "kidb.cpp:Execute(): Failed to connect to db[2, ]."};
   EXPECT_EQ(LogLines(), Expected);
 }
 
@@ -208,57 +190,27 @@ class CapabilityFile : public Appliance {
 };
 
 TEST_F(CapabilityFile, ReadsTheFirstLineOfAKey) {
-  const struct {
-    string strContent;
-    int Ret;
-    const char* szValue;
-  } rgCase[] = {
-      {"k=v", 1, "v"},
-      {" \tk \t=\t v w \t\r\n", 3, "v w"},
-      {"k=\"a \"\r\n", 2, "a "},
-      {"k=\"\"a\"\"\n", 3, "\"a\""},
-      {"k=\"", 1, "\""},
-      {"k=\"a", 2, "\"a"},
-      {"k=a=b\n", 3, "a=b"},
-      {"kk=1\n#k=2\nk\nk=3\nk=4\n", 1, "3"},
-      {"k=\nk=1\n", 0, ""},
-      {"K=1\nx=k\n", 0, ""},
-      {"k=0123456789\n", 10, "0123456"},
-      {string("\0=1\nk=\0021", 8), 2, "\0021"},
-  };
   char szValue[8];
-  for (const auto& Case : rgCase) {
-    WriteFile(m_strFile, Case.strContent);
-    EXPECT_EQ(ZAMOCFileGetKeyValue(m_strFile.c_str(), "k", szValue, sizeof(szValue), 0), Case.Ret)
-        << Case.strContent;
-    EXPECT_STREQ(szValue, Case.szValue) << Case.strContent;
+  for (const Lines& Row : ReadTable("capkeys.tsv")) {
+    WriteFile(m_strFile, Row[0]);
+    EXPECT_EQ(itos(ZAMOCFileGetKeyValue(m_strFile.c_str(), "k", szValue, sizeof(szValue), 0)),
+              Row[1])
+        << Row[0];
+    EXPECT_EQ(szValue, Row[2]) << Row[0];
+    EXPECT_EQ(ZAMOCFileGetKeyValue(m_strFile.c_str(), "", szValue, sizeof(szValue), 0), 0);
   }
-  WriteFile(m_strFile, "# comment\n=1\n");
-  EXPECT_EQ(ZAMOCFileGetKeyValue(m_strFile.c_str(), "", szValue, sizeof(szValue), 0), 0);
   EXPECT_LT(ZAMOCFileGetKeyValue("/var/missing", "k", szValue, sizeof(szValue), 0), 0);
   EXPECT_LT(ZAMOCFileGetKeyValue(CAP_DIR, "k", szValue, sizeof(szValue), 0), 0);
 }
 
 TEST_F(CapabilityFile, ChangesTheLinesOfOneKeyAndNoOtherByte) {
-  const string strCrLf = "a=1\r\n \r\n#k=2\r\nb\r\n";
-  const struct {
-    string strBefore, strAfterSet, strAfterRemove;
-    int Removed;
-  } rgCase[] = {
-      {"", "k= v\n", "", 0},
-      {"a=1", "a=1\nk= v\n", "a=1", 0},
-      {strCrLf, strCrLf + "k= v\n", strCrLf, 0},
-      {"#c\n\tk = \"x\"\r\nkk=2\nk=3\n\n z\nk", "#c\nk= v\nkk=2\n\n z\nk", "#c\nkk=2\n\n z\nk", 1},
-      {"a=1\nk=2", "a=1\nk= v\n", "a=1\n", 1},
-      {"k=1\nk=2\nk=3", "k= v\n", "", 1},
-  };
-  for (const auto& Case : rgCase) {
-    WriteFile(m_strFile, Case.strBefore);
+  for (const Lines& Row : ReadTable("capchanges.tsv")) {
+    WriteFile(m_strFile, Row[0]);
     EXPECT_EQ(Set("k", "v"), 0);
-    EXPECT_EQ(ReadFile(m_strFile), Case.strAfterSet);
-    WriteFile(m_strFile, Case.strBefore);
-    EXPECT_EQ(ZAMOCFileRemoveKey(m_strFile.c_str(), "k"), Case.Removed);
-    EXPECT_EQ(ReadFile(m_strFile), Case.strAfterRemove);
+    EXPECT_EQ(ReadFile(m_strFile), Row[1]);
+    WriteFile(m_strFile, Row[0]);
+    EXPECT_EQ(itos(ZAMOCFileRemoveKey(m_strFile.c_str(), "k")), Row[3]);
+    EXPECT_EQ(ReadFile(m_strFile), Row[2]);
   }
   WriteFile(m_strFile, "a=1\nb=2\nc=3");
   const ZAMOCKeyChange rgChange[] = {{"new", "4", "%s=%s\n"},
@@ -272,21 +224,16 @@ TEST_F(CapabilityFile, ChangesTheLinesOfOneKeyAndNoOtherByte) {
 TEST_F(CapabilityFile, ReplacementKeepsOwnerModeAndLink) {
   WriteFile("/var/target", "k=1\n");
   // An ordinary user's namespace knows no second owner.
-  const bool blOwned = chown("/var/target", 1234, 4321) == 0;
-  ASSERT_EQ(chmod("/var/target", 06741), 0);
-  fs::create_symlink("/var/target", m_strFile);
+  const bool blOwned = RunCommand("chown 1234:4321 /var/target").Status == 0;
+  RunCommand("chmod 6741 /var/target; ln -s /var/target " + m_strFile);
   EXPECT_EQ(Set("k", "2"), 0);
   EXPECT_EQ(ReadFile("/var/target"), "k= 2\n");
   EXPECT_TRUE(fs::is_symlink(m_strFile));
-  struct stat Stat, Later;
-  ASSERT_EQ(stat("/var/target", &Stat), 0);
-  EXPECT_EQ(Stat.st_mode & 07777, 06741u);
-  EXPECT_EQ(Stat.st_uid, blOwned ? 1234u : getuid());
-  EXPECT_EQ(Stat.st_gid, blOwned ? 4321u : getgid());
-
+  const string strStat = RunCommand("stat -c '%a %u %g' /var/target").strOutput;
+  EXPECT_EQ(strStat, blOwned ? "6741 1234 4321\n" : "6741 0 0\n");
+  const string strInode = RunCommand("stat -c %i /var/target").strOutput;
   EXPECT_EQ(ZAMOCFileRemoveKey(m_strFile.c_str(), "absent"), 0);
-  ASSERT_EQ(stat("/var/target", &Later), 0);
-  EXPECT_EQ(Stat.st_ino, Later.st_ino) << "a file without the key was written";
+  EXPECT_EQ(RunCommand("stat -c %i /var/target").strOutput, strInode) << "written without need";
 }
 
 TEST_F(CapabilityFile, FailureLeavesTheFileAndNothingElse) {

@@ -14,25 +14,42 @@
 #include <regex>
 #include <sstream>
 
-namespace fs = std::filesystem;
-
-std::string ReadFile(const std::string& strPath) {
+string ReadFile(const string& strPath) {
   std::ostringstream Content;
   Content << std::ifstream(strPath, std::ios::binary).rdbuf();
   return Content.str();
 }
 
-void WriteFile(const std::string& strPath, const std::string& strContent) {
+std::vector<Lines> ReadTable(const string& strName) {
+  std::ifstream File(TESSEL_SOURCE_DIR "/tests/" + strName);
+  std::vector<Lines> Rows;
+  for (string strRow; std::getline(File, strRow);) {
+    Rows.emplace_back(1);
+    for (size_t Pos = 0; Pos < strRow.size(); ++Pos) {
+      if (strRow[Pos] == '\t') {
+        Rows.back().emplace_back();
+      } else if (strRow[Pos] == '\\') {
+        Rows.back().back() += static_cast<char>(std::stoi(strRow.substr(Pos + 1, 3), nullptr, 8));
+        Pos += 3;
+      } else {
+        Rows.back().back() += strRow[Pos];
+      }
+    }
+  }
+  return Rows;
+}
+
+void WriteFile(const string& strPath, const string& strContent) {
   std::ofstream(strPath, std::ios::binary) << strContent;
 }
 
-std::string Sql(const std::string& strDb, const std::string& strSqlCmd) {
+string Sql(const string& strDb, const string& strSqlCmd) {
   const RUN Run = RunCommand("sqlite3 -bail " + strDb + " <<'SQL'\n" + strSqlCmd + "\nSQL");
   EXPECT_EQ(Run.Status, 0) << Run.strOutput << " in " << strSqlCmd;
   return Run.strOutput;
 }
 
-RUN RunCommand(const std::string& strCommand) {
+RUN RunCommand(const string& strCommand) {
   RUN Run;
   FILE* pOutput = popen(("exec 2>&1; " + strCommand).c_str(), "r");
   for (int Byte; (Byte = getc(pOutput)) != EOF;) {
@@ -42,20 +59,20 @@ RUN RunCommand(const std::string& strCommand) {
   return Run;
 }
 
-RUN RunTool(const std::string& strArgs, const std::string& strWrapper) {
+RUN RunTool(const string& strArgs, const string& strWrapper) {
   return RunCommand(strWrapper + " " TESSEL_EMULATOR " " TESSEL_TOOL " " + strArgs);
 }
 
-std::vector<std::string> LogLines() {
+Lines LogLines() {
   static const std::regex Prefix(
       R"(^[A-Z][a-z]{2} [ 123]\d \d\d:\d\d:\d\d(\.\d{3})? \[\d+\] ([^:]*:)\d+:)");
-  std::ifstream Log(LOG_FILE);
-  std::vector<std::string> Lines;
-  for (std::string strLine; std::getline(Log, strLine);) {
+  std::ifstream File(LOG_FILE);
+  Lines Log;
+  for (string strLine; std::getline(File, strLine);) {
     EXPECT_TRUE(std::regex_search(strLine, Prefix)) << strLine;
-    Lines.push_back(std::regex_replace(strLine, Prefix, "$2"));
+    Log.push_back(std::regex_replace(strLine, Prefix, "$2"));
   }
-  return Lines;
+  return Log;
 }
 
 SyslogSocket::SyslogSocket() : m_Fd(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
@@ -66,7 +83,7 @@ SyslogSocket::SyslogSocket() : m_Fd(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0
     char Record[4096];
     for (ssize_t Len; (Len = recv(m_Fd, Record, sizeof(Record), 0)) > 0;) {
       // <11>Nov 24 10:00:00 name: message
-      const std::string strRecord(Record, static_cast<size_t>(Len));
+      const string strRecord(Record, static_cast<size_t>(Len));
       m_Records.push_back(strRecord.substr(0, 4) + strRecord.substr(strRecord.find(": ") + 1));
     }
   });
@@ -74,7 +91,7 @@ SyslogSocket::SyslogSocket() : m_Fd(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0
 
 SyslogSocket::~SyslogSocket() { Stop(); }
 
-std::vector<std::string> SyslogSocket::Stop() {
+Lines SyslogSocket::Stop() {
   if (m_Reader.joinable()) {
     // An empty record, after all that were sent before, ends the reader.
     const int Fd = socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
@@ -104,7 +121,7 @@ static bool IsVarPrivate() {
 }
 
 int main(int argc, char** argv) {
-  const std::vector<std::string> Args(argv, argv + argc);
+  const Lines Args(argv, argv + argc);
   ::testing::InitGoogleTest(&argc, argv);
   if (::testing::GTEST_FLAG(list_tests) || IsVarPrivate()) {
     return RUN_ALL_TESTS();
@@ -117,7 +134,7 @@ int main(int argc, char** argv) {
   if (strlen(TESSEL_EMULATOR) != 0) {
     rgArg.push_back(TESSEL_EMULATOR);
   }
-  for (const std::string& strArg : Args) {
+  for (const string& strArg : Args) {
     rgArg.push_back(strArg.c_str());
   }
   rgArg.push_back(nullptr);

@@ -4,33 +4,41 @@
 
 #include <gtest/gtest.h>
 
+#include <filesystem>
 #include <string>
 #include <thread>
 #include <vector>
+
+namespace fs = std::filesystem;
+using std::string;
+using Lines = std::vector<string>;
 
 constexpr const char* SYSTEM_DB = "/var/packages/Camveld/target/system.db";
 constexpr const char* CAP_DIR = "/var/packages/Camveld/target/@camveld/@KICapInfo";
 constexpr const char* LOG_FILE = "/var/log/camveld/camveld.log";
 
-std::string ReadFile(const std::string& strPath);
-void WriteFile(const std::string& strPath, const std::string& strContent);
+string ReadFile(const string& strPath);
+void WriteFile(const string& strPath, const string& strContent);
 
 struct RUN {
-  int Status;             // exit status, as a shell has it
-  std::string strOutput;  // of both streams
+  int Status;        // exit status, as a shell has it
+  string strOutput;  // of both streams
 };
 
+// The rows of tests/strName: fields parted by tabs, with \ooo for a byte by its octal value.
+std::vector<Lines> ReadTable(const string& strName);
+
 // Runs a shell command.
-RUN RunCommand(const std::string& strCommand);
+RUN RunCommand(const string& strCommand);
 
 // Runs an SQL text with the sqlite3 shell and returns its rows, columns parted by '|'.
-std::string Sql(const std::string& strDb, const std::string& strSqlCmd);
+string Sql(const string& strDb, const string& strSqlCmd);
 
 // Runs the shipped tool, through strace or the like when strWrapper is given.
-RUN RunTool(const std::string& strArgs, const std::string& strWrapper = "");
+RUN RunTool(const string& strArgs, const string& strWrapper = "");
 
 // The lines of the package log, without time, process id and line number.
-std::vector<std::string> LogLines();
+Lines LogLines();
 
 // Receives what is sent to /dev/log while it lives.
 class SyslogSocket {
@@ -38,11 +46,11 @@ class SyslogSocket {
   SyslogSocket();
   ~SyslogSocket();
   // The records so far, from the message on. Ends the reception.
-  std::vector<std::string> Stop();
+  Lines Stop();
 
  private:
   int m_Fd;
-  std::vector<std::string> m_Records;
+  Lines m_Records;
   std::thread m_Reader;
 };
 

@@ -1,20 +1,13 @@
 // The whole tool, as an installer runs it, on a real database and real capability files.
 
-#include <algorithm>
 #include <cstring>
-#include <filesystem>
 #include <fstream>
 #include <map>
 #include <regex>
 #include <set>
-#include <sstream>
 
 #include "rig.h"
 #include "utils.h"
-
-namespace fs = std::filesystem;
-using std::string;
-using Lines = std::vector<string>;
 
 namespace {
 
@@ -31,14 +24,9 @@ struct ACTION {
 
 std::vector<ACTION> ReadActions() {
   std::vector<ACTION> Actions;
-  std::ifstream Rows(TESSEL_SOURCE_DIR "/tests/actions.tsv");
-  for (string strRow; std::getline(Rows, strRow);) {
-    std::istringstream Fields(strRow);
-    ACTION& Action = Actions.emplace_back();
-    Fields >> Action.orgVersion >> Action.strName >> std::ws;
-    for (string strText; std::getline(Fields, strText, '\t');) {
-      Action.Texts.push_back(strText);
-    }
+  for (const Lines& Row : ReadTable("actions.tsv")) {
+    Actions.push_back(
+        {static_cast<uint32_t>(std::stoul(Row[0])), Row[1], {Row.begin() + 2, Row.end()}});
   }
   return Actions;
 }
@@ -104,52 +92,15 @@ TEST_F(Upgrade, WithoutDatabaseEachActionFailsOnce) {
 }
 
 TEST_F(Upgrade, FailedTextIsUndoneWholeAndEndsItsAction) {
-  const ACTION& Axis = *std::find_if(m_Actions.begin(), m_Actions.end(), [](const ACTION& Action) {
-    return Action.strName == "UpdateAxisA8105E";
-  });
-  const string &strUpdate = Axis.Texts[1], &strInsert = Axis.Texts[2];
-  const struct {
-    string strAction, strRefused;
-    size_t FailingText;
-    Lines Texts;  // in place of the action's own
-  } rgCase[] = {
-      {"RenameAbusTvip62000Reso",
-       "UPDATE OF resolution ON camera WHEN new.resolution='640x480'",
-       1,
-       {}},
-      {"UpdateCameraModelRenameForHIKVISION",
-       "UPDATE OF model ON camera WHEN new.model='DS-2CD783F-E'",
-       3,
-       {}},
-      {"UpdateToshibaIKWD01AAndIKWB70AReso",
-       "UPDATE OF mobile_resolution ON camera WHEN new.mobile_resolution='352x240'",
-       0,
-       {}},
-      {"UpdateDAHUASD4XC212S",
-       "UPDATE OF mobile_resolution ON camera WHEN new.mobile_resolution='1280x720'",
-       0,
-       {}},
-      {Axis.strName,
-       "UPDATE OF connected_wire ON camera WHEN new.id=149",
-       2,
-       {strUpdate + " AND id<149", strInsert + " AND id<149",
-        "UPDATE camera SET connected_wire='\2\1' WHERE vendor='AXIS' AND model='A8105-E' AND "
-        "id=149;"}},
-      {Axis.strName,
-       "INSERT ON camdeviceoutput WHEN new.cam_id=149",
-       2,
-       {strUpdate + " AND id<=149", strInsert + " AND id<149",
-        "INSERT INTO camdeviceoutput (cam_id, cam_id_on_rec_server, owner_ds_id, type, idx, name) "
-        "VALUES (149, 0, 0, 1, 1, 'DO 2');"}},
-  };
-  for (const auto& Case : rgCase) {
+  for (const Lines& Case : ReadTable("failures.tsv")) {
     StartOver();
     Lines Log = {VersionLine("0")};
     string strDone;
     for (const ACTION& Action : m_Actions) {
-      const bool blFails = Action.strName == Case.strAction;
-      const Lines& Texts = blFails && !Case.Texts.empty() ? Case.Texts : Action.Texts;
-      const size_t Done = blFails ? Case.FailingText : Texts.size();
+      const bool blFails = Action.strName == Case[0];
+      const Lines Texts =
+          Case.size() > 3 && blFails ? Lines(Case.begin() + 3, Case.end()) : Action.Texts;
+      const size_t Done = blFails ? std::stoul(Case[2]) : Texts.size();
       for (size_t Text = 0; Text < Done; ++Text) {
         strDone += Texts[Text] + ";";
       }
@@ -160,11 +111,11 @@ TEST_F(Upgrade, FailedTextIsUndoneWholeAndEndsItsAction) {
       }
     }
     const string strTrigger =
-        "CREATE TRIGGER t BEFORE " + Case.strRefused + " BEGIN SELECT RAISE(ABORT,'refused'); END;";
+        "CREATE TRIGGER t BEFORE " + Case[1] + " BEGIN SELECT RAISE(ABORT,'refused'); END;";
     Sql(EXPECTED_DB, strDone + strTrigger);
     Sql(SYSTEM_DB, strTrigger);
     EXPECT_EQ(RunTool("0").Status, 255);
-    EXPECT_EQ(Sql(SYSTEM_DB, ".dump"), Sql(EXPECTED_DB, ".dump")) << Case.strRefused;
+    EXPECT_EQ(Sql(SYSTEM_DB, ".dump"), Sql(EXPECTED_DB, ".dump")) << Case[1];
     EXPECT_EQ(LogLines(), Log);
   }
 }
@@ -219,24 +170,12 @@ TEST_F(Upgrade, CapabilityDirectoryIsThePackagesOwn) {
 }
 
 TEST_F(Upgrade, CapabilityFilesChangeByTheirOwnKeys) {
-  const std::pair<string, string> rgBeforeAfter[] = {
-      {"ptz_continuous_move=yes\npan=yes\ntilt=no\n",
-       "pan= continuous\ntilt=no\nptz_speed_max = 1\n"},
-      {"zoom=\"yes\"\r\nptz_continuous_move = \"yes\"\r\n", "zoom= continuous\n"},
-      {"pan=yes\ntilt=yes\nzoom=yes", "pan= step\ntilt= step\nzoom= step\n"},
-      {"ptz_continuous_move=no\npan=yes\n", "ptz_continuous_move=no\npan= step\n"},
-      {"ptz_continuous_move=Yes\npan=YES\n", "ptz_continuous_move=Yes\npan=YES\n"},
-      {"tilt=continuous", "tilt=continuous\nptz_speed_max = 1\n"},
-      {"zoom=continuous\npan=step\n", "zoom=continuous\npan=step\n"},
-      {"pan=continuous\nptz_speed_max=7\n", "pan=continuous\nptz_speed_max=7\n"},
-      {"ptz_speed_max=\npan=continuous\n", "ptz_speed_max = 1\npan=continuous\n"},
-  };
   // 511 bytes, as many as are used of a name; the "/." behind it is cut off.
   const string strDir = "/var/" + string(250, 'a') + "/" + string(255, 'b');
   fs::create_directories(strDir + "/subdirectory");
   int File = 0;
-  for (const auto& [strBefore, strAfter] : rgBeforeAfter) {
-    WriteFile(strDir + "/" + itos(File++), strBefore);
+  for (const Lines& Row : ReadTable("capfiles.tsv")) {
+    WriteFile(strDir + "/" + itos(File++), Row[0]);
   }
   WriteFile("/var/elsewhere", "pan=yes\n");
   RunCommand("cd " + strDir + " && mkfifo fifo && ln -s /var/elsewhere link && " +
@@ -244,8 +183,8 @@ TEST_F(Upgrade, CapabilityFilesChangeByTheirOwnKeys) {
 
   EXPECT_EQ(RunTool("--updateCap " + strDir + "/.").Status, 0);
   File = 0;
-  for (const auto& [strBefore, strAfter] : rgBeforeAfter) {
-    EXPECT_EQ(ReadFile(strDir + "/" + itos(File++)), strAfter) << "from " << strBefore;
+  for (const Lines& Row : ReadTable("capfiles.tsv")) {
+    EXPECT_EQ(ReadFile(strDir + "/" + itos(File++)), Row[1]) << "from " << Row[0];
   }
   EXPECT_EQ(ReadFile("/var/elsewhere"), "pan= step\n");
   EXPECT_TRUE(fs::is_symlink(strDir + "/link"));
