@@ -16,6 +16,22 @@
 
 KiDbgLogCfg* g_pDbgLogCfg = nullptr;
 
+template <>
+KiEnum2StrMap<LOG_LEVEL>::KiEnum2StrMap()
+    : m_szMap{
+          {LOG_LEVEL_ALARM, "alarm"},   {LOG_LEVEL_ERROR, "error"},   {LOG_LEVEL_WARN, "warn"},
+          {LOG_LEVEL_NOTICE, "notice"}, {LOG_LEVEL_INFO, "info"},     {LOG_LEVEL_DEBUG, "debug"},
+          {LOG_LEVEL_DEBUG2, "debug2"}, {LOG_LEVEL_DEBUG3, "debug3"},
+      } {}
+
+template <>
+KiEnum2StrMap<LOG_CATEG>::KiEnum2StrMap()
+    : m_szMap{
+#define LOG_CATEG_ENTRY(Categ, Value, szName) {Categ, szName},
+#include "logcateg.def"
+      } {
+}
+
 namespace {
 
 constexpr int LOG_LOCK_TIMEOUT_SEC = 120;

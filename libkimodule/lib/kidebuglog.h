@@ -1,11 +1,40 @@
 // The package's log: one call appends one line to a log file that all of its processes share.
 #pragma once
 
+#include "enumtostr.h"
+
 // Which log file a line goes to.
 enum LOG_TYPE : int {
   KI_LOG = 0,            // /var/log/camveld/camveld.log
   NOTIFICATION_LOG = 1,  // /var/log/camveld/kinotification.log
 };
+
+// How severe a message is: the smaller, the more.
+enum LOG_LEVEL : int {
+  LOG_LEVEL_ALARM = 0,
+  LOG_LEVEL_ERROR = 1,
+  LOG_LEVEL_WARN = 2,
+  LOG_LEVEL_NOTICE = 3,
+  LOG_LEVEL_INFO = 4,
+  LOG_LEVEL_DEBUG = 5,
+  LOG_LEVEL_DEBUG2 = 6,
+  LOG_LEVEL_DEBUG3 = 7,
+  LOG_LEVEL_TOTAL = 8,  // how many there are, not a level
+};
+
+// Which component of the package a message comes from.
+enum LOG_CATEG : int {
+#define LOG_CATEG_ENTRY(Categ, Value, szName) Categ = (Value),
+#include "logcateg.def"
+  LOG_CATEG_TOTAL = 88,  // how many there are, not a category
+  LOG_CATEG_MAX = 512,   // how many there may ever be
+};
+
+// The names that stand for them in log lines, as Enum2String gives them.
+template <>
+KiEnum2StrMap<LOG_LEVEL>::KiEnum2StrMap();
+template <>
+KiEnum2StrMap<LOG_CATEG>::KiEnum2StrMap();
 
 class KiDbgLogCfg;
 
