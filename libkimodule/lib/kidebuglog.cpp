@@ -6,6 +6,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdarg>
 #include <cstdio>
@@ -15,6 +16,9 @@
 #include "utils.h"
 
 KiDbgLogCfg* g_pDbgLogCfg = nullptr;
+pid_t g_DbgLogPid = 0;
+
+// --- Names ---
 
 template <>
 KiEnum2StrMap<LOG_LEVEL>::KiEnum2StrMap()
@@ -32,6 +36,8 @@ KiEnum2StrMap<LOG_CATEG>::KiEnum2StrMap()
       } {
 }
 
+// --- The log writer ---
+
 namespace {
 
 constexpr int LOG_LOCK_TIMEOUT_SEC = 120;
@@ -47,14 +53,28 @@ const char* KiGetLogFilePath(LOG_TYPE LogType) {
   return nullptr;
 }
 
+bool LogInMs() {
+  const KiDbgLogCfg* pCfg = g_pDbgLogCfg;
+  return pCfg != nullptr && pCfg->LogInMs();
+}
+
 // Fills the FIELD_SIZE bytes of szTime, or leaves them empty when the clock cannot be converted.
+// The month has its English name in every locale.
 const char* KiGetPresentTime(char* szTime) {
+  static const char* const rgMonth[] = {"Jan", "Feb", "Mar", "Apr", "May", "Jun",
+                                        "Jul", "Aug", "Sep", "Oct", "Nov", "Dec"};
   timeval tvNow;
   tm Local;
   gettimeofday(&tvNow, nullptr);
-  if (localtime_r(&tvNow.tv_sec, &Local) != nullptr) {
-    strftime(szTime, FIELD_SIZE, "%b %e %T", &Local);
+  if (localtime_r(&tvNow.tv_sec, &Local) == nullptr) {
+    return szTime;
   }
+  char szTimeMs[32] = "";
+  if (LogInMs()) {
+    snprintf(szTimeMs, sizeof(szTimeMs), ".%03ld", static_cast<long>(tvNow.tv_usec / 1000));
+  }
+  snprintf(szTime, FIELD_SIZE, "%s %2d %02d:%02d:%02d%s", rgMonth[Local.tm_mon], Local.tm_mday,
+           Local.tm_hour, Local.tm_min, Local.tm_sec, szTimeMs);
   return szTime;
 }
 
@@ -108,20 +128,145 @@ void WritePrefix(FILE* pStream, const char* szCateg, const char* szLevel, const 
           GetBaseName(szFile).c_str(), LineNo, szFunc);
 }
 
+// To be called with thread cancellation disabled.
+__attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const char* szCateg,
+                                                     const char* szLevel, const char* szFile,
+                                                     int LineNo, const char* szFunc,
+                                                     const char* szFormat, va_list Args) {
+  if (FILE* pStream = OpenLog(LogType)) {
+    WritePrefix(pStream, szCateg, szLevel, szFile, LineNo, szFunc);
+    vfprintf(pStream, szFormat, Args);
+    fflush(pStream);
+    KiFlock::UnLock(fileno(pStream));
+    fclose(pStream);
+  }
+}
+
 }  // namespace
 
 void KiPrintf(LOG_TYPE LogType, const char* szCateg, const char* szLevel, const char* szFile,
               int LineNo, const char* szFunc, const char* szFormat, ...) {
   pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, nullptr);
-  if (FILE* pStream = OpenLog(LogType)) {
-    WritePrefix(pStream, szCateg, szLevel, szFile, LineNo, szFunc);
-    va_list Args;
-    va_start(Args, szFormat);
-    vfprintf(pStream, szFormat, Args);
-    va_end(Args);
-    fflush(pStream);
-    KiFlock::UnLock(fileno(pStream));
-    fclose(pStream);
-  }
+  va_list Args;
+  va_start(Args, szFormat);
+  WriteLine(LogType, szCateg, szLevel, szFile, LineNo, szFunc, szFormat, Args);
+  va_end(Args);
   pthread_setcancelstate(PTHREAD_CANCEL_ENABLE, nullptr);
 }
+
+void KiDbgPrintf(LOG_CATEG Categ, LOG_LEVEL Level, const char* szFile, int LineNo,
+                 const char* szFunc, const char* szFormat, ...) {
+  int OldState = PTHREAD_CANCEL_ENABLE;
+  pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &OldState);
+  va_list Args;
+  va_start(Args, szFormat);
+  WriteLine(KI_LOG, Enum2String(Categ), Enum2String(Level), szFile, LineNo, szFunc, szFormat, Args);
+  va_end(Args);
+  pthread_setcancelstate(OldState, nullptr);
+}
+
+// --- The shared configuration ---
+
+namespace {
+
+// Other processes read and write meanwhile: each access is one that the compiler can neither split
+// nor leave out.
+template <typename T>
+T Load(const T& Field) {
+  return __atomic_load_n(&Field, __ATOMIC_RELAXED);
+}
+
+template <typename T>
+void Store(T& Field, T Value) {
+  __atomic_store_n(&Field, Value, __ATOMIC_RELAXED);
+}
+
+bool IsCateg(LOG_CATEG Categ) { return Categ >= 0 && Categ < LOG_CATEG_MAX; }
+
+}  // namespace
+
+LOG_LEVEL KiDbgLogCfg::GetLogLevel(LOG_CATEG Categ) const {
+  return IsCateg(Categ) ? Load(m_LogLevels[Categ]) : LOG_LEVEL_ALARM;
+}
+
+void KiDbgLogCfg::SetLogLevel(LOG_CATEG Categ, LOG_LEVEL Level) {
+  if (IsCateg(Categ)) {
+    Store(m_LogLevels[Categ], Level);
+  }
+}
+
+bool KiDbgLogCfg::LogInMs() const { return Load(m_blLogInMs) != 0; }
+
+void KiDbgLogCfg::SetLogInMs(bool blLogInMs) { Store<uint8_t>(m_blLogInMs, blLogInMs ? 1 : 0); }
+
+LOG_LEVEL KiDbgLogCfg::GetPidLevel(pid_t Pid) const {
+  const int Idx = FindPid(Pid, UsedPids());
+  return Idx == -1 ? LOG_LEVEL_ALARM : Load(m_PidLevels[Idx].Level);
+}
+
+int KiDbgLogCfg::GetPidLevel(int Idx, pid_t& Pid, LOG_LEVEL& Level) const {
+  if (Idx < 0 || Idx >= UsedPids()) {
+    return -1;
+  }
+  Pid = Load(m_PidLevels[Idx].Pid);
+  Level = Load(m_PidLevels[Idx].Level);
+  return 0;
+}
+
+void KiDbgLogCfg::SetPidLevel(pid_t Pid, LOG_LEVEL Level) {
+  const int Count = UsedPids();
+  const int Idx = FindPid(Pid, Count);
+  if (Idx != -1) {
+    Store(m_PidLevels[Idx].Level, Level);
+  } else if (Count < MAX_PIDS) {
+    Store(m_PidLevels[Count].Pid, Pid);
+    Store(m_PidLevels[Count].Level, Level);
+    SetUsedPids(Count + 1);
+  }
+}
+
+void KiDbgLogCfg::ClearPid(pid_t Pid) {
+  const int Count = UsedPids();
+  int Idx = FindPid(Pid, Count);
+  if (Idx == -1) {
+    return;
+  }
+  for (; Idx + 1 < Count; ++Idx) {
+    Store(m_PidLevels[Idx].Pid, Load(m_PidLevels[Idx + 1].Pid));
+    Store(m_PidLevels[Idx].Level, Load(m_PidLevels[Idx + 1].Level));
+  }
+  SetUsedPids(Count - 1);
+}
+
+// The count comes from other processes: it is never followed outside the table.
+int KiDbgLogCfg::UsedPids() const {
+  return std::clamp(__atomic_load_n(&m_PidCnt, __ATOMIC_ACQUIRE), 0, MAX_PIDS);
+}
+
+// Whoever sees the new count sees the entries that it covers.
+void KiDbgLogCfg::SetUsedPids(int Count) { __atomic_store_n(&m_PidCnt, Count, __ATOMIC_RELEASE); }
+
+// The first of Count entries that is Pid's, or -1.
+int KiDbgLogCfg::FindPid(pid_t Pid, int Count) const {
+  for (int Idx = 0; Idx < Count; ++Idx) {
+    if (Load(m_PidLevels[Idx].Pid) == Pid) {
+      return Idx;
+    }
+  }
+  return -1;
+}
+
+int KiShmDbgLogIPCKey() { return 0x18180004; }
+
+KiDbgLogCfg* KiShmDbgLogCfgAt() { return ShmAt<KiDbgLogCfg>(KiShmDbgLogIPCKey()); }
+
+void InitDbgCfg() { g_pDbgLogCfg = KiShmDbgLogCfgAt(); }
+
+void FreeDbgCfg() { ShmDt(g_pDbgLogCfg); }
+
+// In a static library these stand behind the program's own objects, and so run when those are
+// constructed. In a shared one they would run before: there kidebuglog_start.cpp takes their place.
+#ifndef KIMODULE_SHARED
+__attribute__((constructor)) static void AtStart() { InitDbgCfg(); }
+__attribute__((destructor)) static void AtExit() { FreeDbgCfg(); }
+#endif
