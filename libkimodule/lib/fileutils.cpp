@@ -1,5 +1,10 @@
 #include "fileutils.h"
 
+#include <fcntl.h>
+#include <pthread.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
@@ -86,6 +91,153 @@ int GetKeyVals(const char* szFile, const KEY_SET* pKeys, KEY_VAL_MAP& KeyVals) {
   return Match;
 }
 
+// A thread that is cancelled half-way through a change would leave a temporary file and a lock.
+class CancelDisabler {
+ public:
+  CancelDisabler() { pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, nullptr); }
+  ~CancelDisabler() { pthread_setcancelstate(PTHREAD_CANCEL_ENABLE, nullptr); }
+  CancelDisabler(const CancelDisabler&) = delete;
+  CancelDisabler& operator=(const CancelDisabler&) = delete;
+};
+
+// A file beside szTemplate that disappears with the object unless it was given its final name.
+class TmpFile {
+ public:
+  explicit TmpFile(const char* szTemplate) : m_strName(CreateTmpFile(szTemplate)) {}
+  ~TmpFile() {
+    if (!m_strName.empty()) {
+      unlink(m_strName.c_str());
+    }
+  }
+  TmpFile(const TmpFile&) = delete;
+  TmpFile& operator=(const TmpFile&) = delete;
+
+  // Empty when it could not be created.
+  const char* Name() const { return m_strName.c_str(); }
+
+  int RenameTo(const char* szFile) {
+    const int Ret = rename(m_strName.c_str(), szFile);
+    if (Ret == 0) {
+      m_strName.clear();
+    }
+    return Ret;
+  }
+
+ private:
+  std::string m_strName;
+};
+
+// Returns 0, or the errno of the step that failed.
+int WriteText(const char* szFile, const std::string& strText) {
+  const int Fd = open(szFile, O_WRONLY | O_TRUNC | O_CLOEXEC);
+  if (Fd == -1) {
+    return errno;
+  }
+  int Errno = 0;
+  for (size_t Done = 0; Done < strText.size() && Errno == 0;) {
+    const ssize_t Len = write(Fd, strText.data() + Done, strText.size() - Done);
+    if (Len >= 0) {
+      Done += static_cast<size_t>(Len);
+    } else if (errno != EINTR) {
+      Errno = errno;
+    }
+  }
+  if (close(Fd) != 0 && Errno == 0) {
+    Errno = errno;
+  }
+  return Errno;
+}
+
+int WriteToFile(const char* szFile, const KEY_VAL_MAP& KeyVals, bool blQuoteVal) {
+  if (szFile == nullptr || *szFile == '\0') {
+    KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "File not specified.\n");
+    return -1;
+  }
+  const char* const szQuote = blQuoteVal ? "\"" : "";
+  std::string strText;
+  for (const auto& [strKey, strVal] : KeyVals) {
+    strText.append(strKey).append("=").append(szQuote).append(strVal).append(szQuote).append("\n");
+  }
+  const int Errno = WriteText(szFile, strText);
+  if (Errno != 0) {
+    KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to wrtie file [%s] with errno [%d].\n",
+             szFile, Errno);
+    return -1;
+  }
+  return 0;
+}
+
+int WriteToFileAtomic(const char* szFile, const KEY_VAL_MAP& KeyVals, bool blQuoteVal) {
+  TmpFile Tmp(szFile);
+  if (WriteToFile(Tmp.Name(), KeyVals, blQuoteVal) != 0) {
+    return -1;
+  }
+  struct stat Stat;
+  if (stat(szFile, &Stat) != 0) {
+    KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to stat file [%s] with errno [%d]\n", szFile,
+             errno);
+    return -1;
+  }
+  if (chown(Tmp.Name(), Stat.st_uid, Stat.st_gid) != 0) {
+    KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to chown [%s] with errno [%d]\n", Tmp.Name(),
+             errno);
+    return -1;
+  }
+  if (chmod(Tmp.Name(), Stat.st_mode & 07777) != 0) {
+    KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to chmod [%s] with errno [%d]\n", Tmp.Name(),
+             errno);
+    return -1;
+  }
+  if (Tmp.RenameTo(szFile) != 0) {
+    KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR,
+             "Failed to rename file [%s] to [%s] with errno [%d]\n", Tmp.Name(), szFile, errno);
+    return -1;
+  }
+  return 0;
+}
+
+// Whoever held the lock before may have replaced the file that it was waited for on.
+int LockCurrent(KiFlock& Lock) {
+  while (Lock.LockEx(-1) == 0) {
+    if (Lock.IsCurrent()) {
+      return 0;
+    }
+    Lock.UnLock();
+  }
+  return -1;
+}
+
+int UpdateKeyVals(const char* szFile, const KEY_VAL_MAP& AddKeyVals, const KEY_SET& DelKeys,
+                  bool blQuoteVal) {
+  if (AddKeyVals.empty() && DelKeys.empty()) {
+    return 0;
+  }
+  const CancelDisabler NoCancel;
+  KiFlock Lock(szFile);
+  if (LockCurrent(Lock) != 0) {
+    KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to lock file [%s] with errno [%d]\n", szFile,
+             errno);
+    return -1;
+  }
+  KEY_VAL_MAP KeyVals;
+  int Match = 0;
+  const File pFile(fopen(szFile, "re"));
+  const int Errno = pFile == nullptr ? errno : ReadKeyVals(pFile.get(), nullptr, KeyVals, Match);
+  if (Errno != 0) {
+    // After a failed read too: what was read so far must not become the whole file.
+    KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to open file [%s] with errno [%d]\n", szFile,
+             Errno);
+    return -1;
+  }
+  for (const auto& [strKey, strVal] : AddKeyVals) {
+    KeyVals[strKey] = strVal;
+  }
+  for (const std::string& strKey : DelKeys) {
+    KeyVals.erase(strKey);
+  }
+  return WriteToFileAtomic(szFile, KeyVals, blQuoteVal);
+}
+
 }  // namespace
 
 int KiFileGetAllKeyVals(const char* szFile, std::map<std::string, std::string>& KeyVals) {
@@ -106,4 +258,33 @@ int KiFileGetVal(const char* szFile, const char* szKey, std::string& strVal) {
   const int Ret = GetKeyVals(szFile, &Keys, KeyVals);
   strVal = KeyVals[strKey];
   return Ret;
+}
+
+int KiFileSetVal(const char* szFile, const char* szKey, const char* szVal, bool blQuoteVal) {
+  return UpdateKeyVals(szFile, {{szKey, szVal}}, {}, blQuoteVal);
+}
+
+int KiFileSetVals(const char* szFile, const std::map<std::string, std::string>& NewKeyVals,
+                  bool blQuoteVal) {
+  return UpdateKeyVals(szFile, NewKeyVals, {}, blQuoteVal);
+}
+
+int KiFileRemoveKey(const char* szFile, const char* szKey) {
+  return UpdateKeyVals(szFile, {}, {szKey}, false);
+}
+
+int KiFileRemoveKeys(const char* szFile, const std::set<std::string>& Keys) {
+  return UpdateKeyVals(szFile, {}, Keys, false);
+}
+
+std::string CreateTmpFile(const char* szTemplate) {
+  std::string strName = std::string(szTemplate) + ".tmp.XXXXXX";
+  const int Fd = mkostemp(strName.data(), O_CLOEXEC);
+  if (Fd == -1) {
+    KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to create tmp file with errno [%d]\n",
+             errno);
+    return "";
+  }
+  close(Fd);
+  return strName;
 }

@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -22,6 +23,13 @@ KiFlock::~KiFlock() { UnLock(); }
 int KiFlock::LockSh(int TimeoutSec) { return Flock(TimeoutSec, false); }
 
 int KiFlock::LockEx(int TimeoutSec) { return Flock(TimeoutSec, true); }
+
+bool KiFlock::IsCurrent() const {
+  struct stat Open;
+  struct stat Named;
+  return fstat(m_Fd, &Open) == 0 && stat(m_strName.c_str(), &Named) == 0 &&
+         Open.st_dev == Named.st_dev && Open.st_ino == Named.st_ino;
+}
 
 void KiFlock::UnLock() {
   if (m_Fd < 0) {

@@ -22,6 +22,10 @@ class KiFlock {
   int LockSh(int TimeoutSec);
   int LockEx(int TimeoutSec);
 
+  // Whether the path still leads to the file that this object has open. Where files are replaced
+  // under their lock, one obtained after waiting may be that of a file already replaced.
+  bool IsCurrent() const;
+
   // Does nothing on an object that holds no descriptor.
   void UnLock();
 
