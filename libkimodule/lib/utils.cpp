@@ -1,8 +1,161 @@
 #include "utils.h"
 
+#include <algorithm>
+#include <cstdlib>
+#include <cstring>
+#include <limits>
+#include <memory>
+
+namespace {
+
+// The value of a hexadecimal digit, or -1.
+int HexDigit(char Character) {
+  if (Character >= '0' && Character <= '9') {
+    return Character - '0';
+  }
+  if (Character >= 'a' && Character <= 'f') {
+    return Character - 'a' + 10;
+  }
+  if (Character >= 'A' && Character <= 'F') {
+    return Character - 'A' + 10;
+  }
+  return -1;
+}
+
+char toHex(unsigned Nibble) { return static_cast<char>(Nibble > 9 ? Nibble + 55 : Nibble + 48); }
+
+int32_t ToInt32(const char* szText) {
+  constexpr long MIN = std::numeric_limits<int32_t>::min();
+  constexpr long MAX = std::numeric_limits<int32_t>::max();
+  return static_cast<int32_t>(std::clamp(strtol(szText, nullptr, 10), MIN, MAX));
+}
+
+}  // namespace
+
 std::string GetBaseName(const std::string& strFullPath) {
   // npos + 1 is 0: without a separator the whole path is its own base name.
   return strFullPath.substr(strFullPath.find_last_of("/\\") + 1);
 }
 
 std::string itos(int64_t i) { return std::to_string(i); }
+
+int32_t Hex2Dec(const char* pHex, int32_t Len) {
+  uint32_t Value = 0;
+  for (int32_t Idx = 0; Idx < Len; ++Idx) {
+    const int Digit = HexDigit(pHex[Idx]);
+    if (Digit == -1) {
+      break;
+    }
+    Value = Value * 16 + static_cast<uint32_t>(Digit);
+  }
+  return static_cast<int32_t>(Value);
+}
+
+std::string urlEncoding(const std::string& strInput, const std::string& strExtraUrlUnencodedChars) {
+  static const std::string strUnencoded =
+      "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789_~()*,-.";
+  static const std::string strWhite = " \t\n\v\f\r";
+  std::string strOutput;
+  for (const char Character : strInput) {
+    const auto IsIn = [&](const std::string& strSet) {
+      return strSet.find(Character) != std::string::npos;
+    };
+    const auto Byte = static_cast<unsigned char>(Character);
+    if (IsIn(strWhite)) {
+      strOutput += "%20";
+    } else if (IsIn(strUnencoded) || IsIn(strExtraUrlUnencodedChars)) {
+      strOutput += Character;
+    } else {
+      strOutput += {'%', toHex(Byte >> 4), toHex(Byte & 15)};
+    }
+  }
+  return strOutput;
+}
+
+void StringEraseCharacter(std::string& strInput, char Character) {
+  strInput.erase(std::remove(strInput.begin(), strInput.end(), Character), strInput.end());
+}
+
+std::string Trim(const std::string& strOrig, const char* szChars) {
+  if (szChars == nullptr) {
+    return strOrig;
+  }
+  const size_t First = strOrig.find_first_not_of(szChars);
+  if (First == std::string::npos) {
+    return "";
+  }
+  return strOrig.substr(First, strOrig.find_last_not_of(szChars) - First + 1);
+}
+
+char* Strncpy(char* szDst, const char* szSrc, size_t BufLen) {
+  if (BufLen > 0) {
+    strncpy(szDst, szSrc, BufLen - 1);
+    szDst[BufLen - 1] = '\0';
+  }
+  return szDst;
+}
+
+void ReplaceSubstr(std::string& strInput, const std::string& strSub,
+                   const std::string& strReplace) {
+  if (strSub.empty()) {
+    return;
+  }
+  std::string strOutput;
+  size_t Done = 0;
+  for (size_t Pos; (Pos = strInput.find(strSub, Done)) != std::string::npos;) {
+    strOutput.append(strInput, Done, Pos - Done).append(strReplace);
+    Done = Pos + strSub.size();
+  }
+  strOutput.append(strInput, Done, std::string::npos);
+  strInput = std::move(strOutput);
+}
+
+char* HttpBase64Encode(const char* src) {
+  static const char szAlphabet[] =
+      "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
+  const size_t Len = strlen(src);
+  char* const szText = static_cast<char*>(malloc((Len + 2) / 3 * 4 + 1));
+  if (szText == nullptr) {
+    return nullptr;
+  }
+  char* pOut = szText;
+  for (size_t Done = 0; Done < Len; Done += 3) {
+    const size_t Left = Len - Done;
+    const auto Byte = [&](size_t Idx) {
+      return Idx < Left ? static_cast<unsigned char>(src[Done + Idx]) : 0u;
+    };
+    const unsigned Group = Byte(0) << 16 | Byte(1) << 8 | Byte(2);
+    *pOut++ = szAlphabet[Group >> 18];
+    *pOut++ = szAlphabet[Group >> 12 & 63];
+    *pOut++ = Left > 1 ? szAlphabet[Group >> 6 & 63] : '=';
+    *pOut++ = Left > 2 ? szAlphabet[Group & 63] : '=';
+  }
+  *pOut = '\0';
+  return szText;
+}
+
+std::string UnsignedHashToStr(const unsigned char* pHashBuf) {
+  static const char szDigits[] = "0123456789abcdef";
+  std::string strText;
+  for (int Idx = 0; Idx < 16; ++Idx) {
+    strText += {szDigits[pHashBuf[Idx] >> 4], szDigits[pHashBuf[Idx] & 15]};
+  }
+  return strText;
+}
+
+std::vector<int32_t> String2IntVector(const std::string& strValue, const std::string& strDelim) {
+  std::vector<int32_t> Numbers;
+  if (strValue.empty() || strDelim.empty()) {
+    return Numbers;
+  }
+  const std::unique_ptr<char, decltype(&free)> pCopy(strdup(strValue.c_str()), free);
+  if (pCopy == nullptr) {
+    return Numbers;
+  }
+  char* pRest = nullptr;
+  for (const char* szPiece = strtok_r(pCopy.get(), strDelim.c_str(), &pRest); szPiece != nullptr;
+       szPiece = strtok_r(nullptr, strDelim.c_str(), &pRest)) {
+    Numbers.push_back(ToInt32(szPiece));
+  }
+  return Numbers;
+}

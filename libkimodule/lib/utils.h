@@ -4,14 +4,50 @@
 #include <sys/ipc.h>
 #include <sys/shm.h>
 
+#include <cstddef>
 #include <cstdint>
 #include <string>
+#include <vector>
 
 // The part of strFullPath after its last '/' or '\', or all of it when it has neither.
 std::string GetBaseName(const std::string& strFullPath);
 
 // The decimal text of i.
 std::string itos(int64_t i);
+
+// The value of the hexadecimal digits, of either case, among the Len bytes at pHex, up to the first
+// byte that is none; 0 without any. Of more than eight digits the last eight count.
+int32_t Hex2Dec(const char* pHex, int32_t Len);
+
+// strInput percent-encoded for a URL. ASCII letters, digits and _~()*,-. stay, and so do the bytes
+// in strExtraUrlUnencodedChars; white space of any kind becomes %20.
+std::string urlEncoding(const std::string& strInput, const std::string& strExtraUrlUnencodedChars);
+
+// Takes every Character out of strInput.
+void StringEraseCharacter(std::string& strInput, char Character);
+
+// strOrig without the bytes in szChars at its two ends. Null stands for none.
+std::string Trim(const std::string& strOrig, const char* szChars);
+
+// Copies szSrc to szDst, a buffer of BufLen bytes, cutting what does not fit. The copy is always
+// terminated, and the rest of the buffer zeroed; with a BufLen of 0 nothing is done. Returns szDst.
+char* Strncpy(char* szDst, const char* szSrc, size_t BufLen);
+
+// Replaces every strSub in strInput, from left to right; what was put in is not searched again. An
+// empty strSub leaves strInput as it is.
+void ReplaceSubstr(std::string& strInput, const std::string& strSub, const std::string& strReplace);
+
+// The base64 text (RFC 4648, without line breaks) of src, up to its NUL. The caller releases it
+// with free(). Null when there is no memory.
+char* HttpBase64Encode(const char* src);
+
+// The 32 lower-case hexadecimal digits of a 16-byte hash.
+std::string UnsignedHashToStr(const unsigned char* pHashBuf);
+
+// The numbers in strValue, parted by any of the bytes in strDelim, empty pieces left out. Each
+// piece is read as far as it is a decimal number, else it is 0; one beyond the 32-bit range gives
+// the range's nearest end.
+std::vector<int32_t> String2IntVector(const std::string& strValue, const std::string& strDelim);
 
 // Attaches the System V shared memory segment with the key, for reading and writing, viewed as a T.
 // Null when there is none or attaching it is refused. Its size is not compared with T's. The caller
