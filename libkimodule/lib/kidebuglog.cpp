@@ -11,7 +11,12 @@
 #include <cstdarg>
 #include <cstdio>
 #include <ctime>
+#include <map>
+#include <set>
+#include <string>
+#include <vector>
 
+#include "fileutils.h"
 #include "kiflock.h"
 #include "utils.h"
 
@@ -181,9 +186,50 @@ void Store(T& Field, T Value) {
   __atomic_store_n(&Field, Value, __ATOMIC_RELAXED);
 }
 
+constexpr const char* SETTINGS_FILE = "/var/packages/Camveld/etc/settings.conf";
+constexpr const char* LEVELS_KEY = "ki_dbglog_settings";  // by category, parted by commas
+constexpr const char* IN_MS_KEY = "ki_dbglog_time_scale";
+
 bool IsCateg(LOG_CATEG Categ) { return Categ >= 0 && Categ < LOG_CATEG_MAX; }
 
 }  // namespace
+
+void KiDbgLogCfg::Init(int /*ShmKey*/) {
+  SetLogInMs(false);
+  for (int Categ = 0; Categ < LOG_CATEG_TOTAL; ++Categ) {
+    SetLogLevel(static_cast<LOG_CATEG>(Categ), LOG_LEVEL_NOTICE);
+  }
+  for (__PidDbgLevel& Entry : m_PidLevels) {
+    Store(Entry.Pid, 0);
+    Store(Entry.Level, LOG_LEVEL_ALARM);
+  }
+  SetUsedPids(0);
+  LoadDbgLogSettings();
+}
+
+int KiDbgLogCfg::LoadDbgLogSettings() {
+  std::map<std::string, std::string> KeyVals;
+  const int Ret = KiFileGetKeyVals(SETTINGS_FILE, {LEVELS_KEY, IN_MS_KEY}, KeyVals);
+  if (const auto It = KeyVals.find(LEVELS_KEY); It != KeyVals.end()) {
+    int Categ = 0;
+    for (const int32_t Level : String2IntVector(It->second, ",")) {
+      SetLogLevel(static_cast<LOG_CATEG>(Categ++), static_cast<LOG_LEVEL>(Level));
+    }
+  }
+  if (const auto It = KeyVals.find(IN_MS_KEY); It != KeyVals.end()) {
+    SetLogInMs(It->second == "yes");
+  }
+  return Ret;
+}
+
+int KiDbgLogCfg::SaveDbgLogSettings() const {
+  std::string strLevels;
+  for (int Categ = 0; Categ < LOG_CATEG_TOTAL; ++Categ) {
+    strLevels += (Categ == 0 ? "" : ",") + itos(GetLogLevel(static_cast<LOG_CATEG>(Categ)));
+  }
+  return KiFileSetVals(SETTINGS_FILE,
+                       {{LEVELS_KEY, strLevels}, {IN_MS_KEY, LogInMs() ? "yes" : "no"}}, true);
+}
 
 LOG_LEVEL KiDbgLogCfg::GetLogLevel(LOG_CATEG Categ) const {
   return IsCateg(Categ) ? Load(m_LogLevels[Categ]) : LOG_LEVEL_ALARM;

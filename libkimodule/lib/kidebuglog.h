@@ -79,6 +79,18 @@ struct __PidDbgLevel {
 // same moment may lose one of the changes.
 class KiDbgLogCfg {
  public:
+  // Puts everything to its default (LOG_LEVEL_NOTICE for the categories in use, no milliseconds, an
+  // empty process table), and loads the saved settings. ShmKey, the segment's key, is not needed.
+  void Init(int ShmKey);
+
+  // Load the thresholds of the categories and the switch for milliseconds from the package's
+  // settings file, /var/packages/Camveld/etc/settings.conf, and save them there. What is not in the
+  // file stays as it is; numbers beyond LOG_CATEG_MAX are ignored. A save keeps the file's other
+  // keys, as KiFileSetVals does. The process table is not saved. Return what KiFileGetKeyVals and
+  // KiFileSetVals return.
+  int LoadDbgLogSettings();
+  int SaveDbgLogSettings() const;
+
   // LOG_LEVEL_ALARM for a category outside 0 to LOG_CATEG_MAX - 1, whose threshold cannot be set.
   LOG_LEVEL GetLogLevel(LOG_CATEG Categ) const;
   void SetLogLevel(LOG_CATEG Categ, LOG_LEVEL Level);
