@@ -1,12 +1,23 @@
 #include "utils.h"
 
+#include <unistd.h>
+
 #include <algorithm>
+#include <cerrno>
+#include <cmath>
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <limits>
 #include <memory>
 
+#include "delaytimer.h"
+#include "kidebuglog.h"
+
 namespace {
+
+constexpr int32_t WRITE_RETRY_USEC = 10000;
+constexpr int MAX_EMPTY_WRITES = 5;
 
 // The value of a hexadecimal digit, or -1.
 int HexDigit(char Character) {
@@ -158,4 +169,71 @@ std::vector<int32_t> String2IntVector(const std::string& strValue, const std::st
     Numbers.push_back(ToInt32(szPiece));
   }
   return Numbers;
+}
+
+double GetAbsTimeDiffBySec(time_t EndTime, time_t StartTime) {
+  return std::fabs(difftime(EndTime, StartTime));
+}
+
+int64_t GetAbsTimeDiffUSec(const timeval& tvOld, const timeval& tvNew) {
+  const int64_t Diff = GetTimeDiffUSec(tvOld, tvNew);
+  return Diff < 0 ? static_cast<int64_t>(-static_cast<uint64_t>(Diff)) : Diff;
+}
+
+int64_t GetCurTimestamp() {
+  timeval tvNow;
+  gettimeofday(&tvNow, nullptr);
+  return GetTimeDiffUSec({0, 0}, tvNow);
+}
+
+std::string GetISO8601TimeText(int64_t TimeStamp) {
+  const time_t Sec = USecToSec(TimeStamp);
+  const auto MSec = static_cast<long long>(TimeStamp / 1000 % 1000);
+  tm Utc = {};
+  gmtime_r(&Sec, &Utc);
+  char szTime[64] = "";
+  char szMSec[64] = "";
+  strftime(szTime, sizeof(szTime), "%Y%m%dT%H%M%S", &Utc);
+  snprintf(szMSec, sizeof(szMSec), ".%03lldZ", MSec);
+  return std::string(szTime) + szMSec;
+}
+
+int32_t WriteFd(int Fd, const char* pBuf, int32_t BufLen) {
+  DelayTimer Timer(WRITE_RETRY_USEC);
+  int32_t Written = 0;
+  int EmptyWrites = 0;
+  while (Written < BufLen) {
+    const ssize_t Len = write(Fd, pBuf + Written, static_cast<size_t>(BufLen - Written));
+    if (Len > 0) {
+      Written += static_cast<int32_t>(Len);
+    } else if (Len == 0) {
+      if (++EmptyWrites > MAX_EMPTY_WRITES) {
+        break;
+      }
+    } else if (errno == EAGAIN || errno == EINTR) {
+      Timer.Delay();
+    } else {
+      KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_NOTICE, "Write fd[%d] error[%d]\n", Fd, errno);
+      break;
+    }
+  }
+  return Written;
+}
+
+bool CreateThread(ThreadFunc FuncPtr, void* FuncParam, uint32_t StackSize, bool blSetDetach,
+                  pthread_t& ThreadId) {
+  pthread_attr_t Attr;
+  pthread_attr_init(&Attr);
+  if (StackSize != 0) {
+    pthread_attr_setstacksize(&Attr, StackSize);
+  }
+  if (blSetDetach) {
+    pthread_attr_setdetachstate(&Attr, PTHREAD_CREATE_DETACHED);
+  }
+  const bool blStarted = pthread_create(&ThreadId, &Attr, FuncPtr, FuncParam) == 0;
+  if (!blStarted) {
+    KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to create thread.\n");
+  }
+  pthread_attr_destroy(&Attr);
+  return blStarted;
 }

@@ -1,11 +1,14 @@
 // Small, stateless helpers shared by the package's processes. All may be called from any thread.
 #pragma once
 
+#include <pthread.h>
 #include <sys/ipc.h>
 #include <sys/shm.h>
+#include <sys/time.h>
 
 #include <cstddef>
 #include <cstdint>
+#include <ctime>
 #include <string>
 #include <vector>
 
@@ -48,6 +51,46 @@ std::string UnsignedHashToStr(const unsigned char* pHashBuf);
 // piece is read as far as it is a decimal number, else it is 0; one beyond the 32-bit range gives
 // the range's nearest end.
 std::vector<int32_t> String2IntVector(const std::string& strValue, const std::string& strDelim);
+
+// A point in time is a timeval, a count of microseconds since 1970-01-01 00:00:00 UTC
+// ("timestamp"), or a time_t. The current time is the wall clock's, which can be set back.
+
+// The seconds between the two.
+double GetAbsTimeDiffBySec(time_t EndTime, time_t StartTime);
+
+// The microseconds from tvOld to tvNew, negative when tvNew is earlier.
+inline int64_t GetTimeDiffUSec(const timeval& tvOld, const timeval& tvNew) {
+  const auto Sec = static_cast<uint64_t>(tvNew.tv_sec) - static_cast<uint64_t>(tvOld.tv_sec);
+  const auto USec = static_cast<uint64_t>(tvNew.tv_usec) - static_cast<uint64_t>(tvOld.tv_usec);
+  return static_cast<int64_t>(Sec * 1000000 + USec);  // unsigned: defined for every input
+}
+
+int64_t GetAbsTimeDiffUSec(const timeval& tvOld, const timeval& tvNew);
+
+// The timestamp of now.
+int64_t GetCurTimestamp();
+
+// Microseconds as seconds, cut off towards zero.
+inline time_t USecToSec(int64_t USec) { return static_cast<time_t>(USec / 1000000); }
+
+// A timestamp as UTC, like "20231114T221320.123Z". What is below the millisecond is cut off. Before
+// 1970 the milliseconds are negative.
+std::string GetISO8601TimeText(int64_t TimeStamp);
+
+// Writes the BufLen bytes at pBuf to Fd, however many calls it takes, and for as long as it takes:
+// a descriptor that is not ready is tried again every 10 ms. Returns the number of bytes written:
+// fewer than BufLen after an error, which is logged (LOG_CATEG_UTILS, LOG_LEVEL_NOTICE), or when
+// nothing was taken six times.
+int32_t WriteFd(int Fd, const char* pBuf, int32_t BufLen);
+
+typedef void* (*ThreadFunc)(void* pParam);
+
+// Starts a thread that runs FuncPtr(FuncParam), with a stack of StackSize bytes (0, or a size that
+// the system refuses: the default) and, if blSetDetach, detached; else the caller joins it. Returns
+// whether it was started, with its identifier in ThreadId; a failure is logged (LOG_CATEG_UTILS,
+// LOG_LEVEL_ERROR). What FuncParam points to has to live as long as the thread needs it.
+bool CreateThread(ThreadFunc FuncPtr, void* FuncParam, uint32_t StackSize, bool blSetDetach,
+                  pthread_t& ThreadId);
 
 // Attaches the System V shared memory segment with the key, for reading and writing, viewed as a T.
 // Null when there is none or attaching it is refused. Its size is not compared with T's. The caller
