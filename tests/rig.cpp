@@ -59,18 +59,22 @@ RUN RunCommand(const string& strCommand) {
   return Run;
 }
 
+RUN RunProgram(const string& strProgram, const string& strArgs, const string& strWrapper) {
+  return RunCommand(strWrapper + " " TESSEL_EMULATOR " " + strProgram + " " + strArgs);
+}
+
 RUN RunTool(const string& strArgs, const string& strWrapper) {
-  return RunCommand(strWrapper + " " TESSEL_EMULATOR " " TESSEL_TOOL " " + strArgs);
+  return RunProgram(TESSEL_TOOL, strArgs, strWrapper);
 }
 
 Lines LogLines() {
   static const std::regex Prefix(
-      R"(^[A-Z][a-z]{2} [ 123]\d \d\d:\d\d:\d\d(\.\d{3})? \[\d+\] ([^:]*:)\d+:)");
+      R"(^[A-Z][a-z]{2} [ 123]\d \d\d:\d\d:\d\d(\.\d{3})? \[\d+\](\[\d+\])? ?((\[.*?\] )?[^:]*:)\d+:)");
   std::ifstream File(LOG_FILE);
   Lines Log;
   for (string strLine; std::getline(File, strLine);) {
     EXPECT_TRUE(std::regex_search(strLine, Prefix)) << strLine;
-    Log.push_back(std::regex_replace(strLine, Prefix, "$2"));
+    Log.push_back(std::regex_replace(strLine, Prefix, "$3"));
   }
   return Log;
 }

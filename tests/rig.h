@@ -34,10 +34,12 @@ RUN RunCommand(const string& strCommand);
 // Runs an SQL text with the sqlite3 shell and returns its rows, columns parted by '|'.
 string Sql(const string& strDb, const string& strSqlCmd);
 
-// Runs the shipped tool, through strace or the like when strWrapper is given.
+// Runs a program of the build, or the shipped tool, through strace or the like when strWrapper is
+// given.
+RUN RunProgram(const string& strProgram, const string& strArgs, const string& strWrapper = "");
 RUN RunTool(const string& strArgs, const string& strWrapper = "");
 
-// The lines of the package log, without time, process id and line number.
+// The lines of the package log, without time, process and thread id and line number.
 Lines LogLines();
 
 // Receives what is sent to /dev/log while it lives.
