@@ -5,19 +5,17 @@
 #include <dirent.h>
 #include <sys/stat.h>
 
-#include <algorithm>
 #include <cstdint>
 #include <cstdio>
-#include <cstdlib>
 #include <cstring>
 #include <initializer_list>
-#include <limits>
 #include <memory>
 #include <string>
 #include <vector>
 
 #include "kidb.h"
 #include "kidebuglog.h"
+#include "strtoint32.h"
 #include "utils.h"
 #include "zamoc.h"
 
@@ -31,14 +29,7 @@ typedef struct _camveld_upgrader_ {
 // The directory whose capability files are upgraded; empty when there is none.
 static std::string gstrRemoteCapDir;
 
-static int KiAtoi(const char* szText) {
-  if (szText == nullptr) {
-    return 0;
-  }
-  constexpr long MIN = std::numeric_limits<int32_t>::min();
-  constexpr long MAX = std::numeric_limits<int32_t>::max();
-  return static_cast<int>(std::clamp(strtol(szText, nullptr, 10), MIN, MAX));
-}
+static int KiAtoi(const char* szText) { return szText == nullptr ? 0 : StrToInt32(szText); }
 
 // --- What the actions share ---
 

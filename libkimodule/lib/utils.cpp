@@ -8,11 +8,11 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <limits>
 #include <memory>
 
 #include "delaytimer.h"
 #include "kidebuglog.h"
+#include "strtoint32.h"
 
 namespace {
 
@@ -34,12 +34,6 @@ int HexDigit(char Character) {
 }
 
 char toHex(unsigned Nibble) { return static_cast<char>(Nibble > 9 ? Nibble + 55 : Nibble + 48); }
-
-int32_t ToInt32(const char* szText) {
-  constexpr long MIN = std::numeric_limits<int32_t>::min();
-  constexpr long MAX = std::numeric_limits<int32_t>::max();
-  return static_cast<int32_t>(std::clamp(strtol(szText, nullptr, 10), MIN, MAX));
-}
 
 }  // namespace
 
@@ -166,7 +160,7 @@ std::vector<int32_t> String2IntVector(const std::string& strValue, const std::st
   char* pRest = nullptr;
   for (const char* szPiece = strtok_r(pCopy.get(), strDelim.c_str(), &pRest); szPiece != nullptr;
        szPiece = strtok_r(nullptr, strDelim.c_str(), &pRest)) {
-    Numbers.push_back(ToInt32(szPiece));
+    Numbers.push_back(StrToInt32(szPiece));
   }
   return Numbers;
 }

@@ -1,0 +1,16 @@
+// The one reading of decimal numbers, for the library itself and the programs built with it; not
+// installed.
+#pragma once
+
+#include <algorithm>
+#include <cstdint>
+#include <cstdlib>
+#include <limits>
+
+// The number that szText begins with, as strtol reads it, or 0; beyond the 32-bit range the range's
+// nearest end, whatever the size of long.
+inline int32_t StrToInt32(const char* szText) {
+  constexpr long MIN = std::numeric_limits<int32_t>::min();
+  constexpr long MAX = std::numeric_limits<int32_t>::max();
+  return static_cast<int32_t>(std::clamp(strtol(szText, nullptr, 10), MIN, MAX));
+}
