@@ -1,0 +1,16 @@
+# The appliance: ARMv7-A with hardware floating point. The cross compiler is Debian's; what else is
+# needed for this processor, scripts/bootstrap armhf unpacks into the sysroot.
+set(CMAKE_SYSTEM_NAME Linux)
+set(CMAKE_SYSTEM_PROCESSOR armv7l)
+set(CMAKE_LIBRARY_ARCHITECTURE arm-linux-gnueabihf)
+set(CMAKE_CXX_COMPILER arm-linux-gnueabihf-g++)
+
+cmake_path(GET CMAKE_CURRENT_LIST_DIR PARENT_PATH TESSEL_ROOT)
+set(CMAKE_FIND_ROOT_PATH ${TESSEL_ROOT}/build/armhf-sysroot)
+set(CMAKE_FIND_ROOT_PATH_MODE_PROGRAM NEVER)
+set(CMAKE_FIND_ROOT_PATH_MODE_LIBRARY ONLY)
+set(CMAKE_FIND_ROOT_PATH_MODE_INCLUDE ONLY)
+# CMake packages may also lie where a build of this project was installed.
+set(CMAKE_FIND_ROOT_PATH_MODE_PACKAGE BOTH)
+
+set(CMAKE_CROSSCOMPILING_EMULATOR ${TESSEL_ROOT}/tools/run-armhf)
