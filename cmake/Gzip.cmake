@@ -1,0 +1,9 @@
+find_program(GZIP_EXECUTABLE gzip REQUIRED)
+
+# Builds NAME.gz of File in the current binary directory: the same bytes of the same content.
+function(gzip File)
+  cmake_path(GET File FILENAME Name)
+  add_custom_command(OUTPUT ${Name}.gz COMMAND ${GZIP_EXECUTABLE} -9nc ${File} > ${Name}.gz
+                     DEPENDS ${File} VERBATIM)
+  add_custom_target(${Name}.gz-target ALL DEPENDS ${Name}.gz)
+endfunction()
