@@ -1,0 +1,140 @@
+// The helpers, the delay timer, the descriptor writer and the thread launcher.
+
+#include "utils.h"
+
+#include <fcntl.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <memory>
+#include <mutex>
+#include <sstream>
+
+#include "delaytimer.h"
+#include "rig.h"
+
+// In the place of libc's: the clock moves only in sleeps, which signals interrupt and which end 1
+// ms late; a write gives the next number of gWrites, bytes taken or a negative errno, if there is
+// one.
+static int64_t gClock = 1000800000;
+static std::istringstream gWrites;
+
+int gettimeofday(timeval* ptvNow, void* /*pZone*/) noexcept {
+  *ptvNow = {gClock / 1000000, gClock % 1000000};
+  return 0;
+}
+
+int nanosleep(const timespec* pTime, timespec* pLeft) {
+  const long usec = (pTime->tv_nsec + 1000) / 2000;
+  pLeft->tv_nsec = pTime->tv_nsec - usec * 1000;
+  gClock += pLeft->tv_nsec == 0 ? usec + 1000 : usec;
+  errno = EINTR;
+  return pLeft->tv_nsec == 0 ? 0 : -1;
+}
+
+ssize_t write(int Fd, const void* pBuf, size_t Len) {
+  int Ret = 0;
+  if (gWrites >> Ret) {
+    errno = -Ret;
+    return Ret < 0 ? -1 : Ret;
+  }
+  return syscall(SYS_write, Fd, pBuf, Len);
+}
+
+namespace {
+
+class Utils : public Appliance {};
+
+TEST_F(Utils, HelpersAtTheirLimits) {
+  EXPECT_EQ(String2IntVector(",1;;x, -7,12x,+3;4294967296,-2147483649", ",;"),
+            std::vector<int32_t>({1, 0, -7, 12, 3, INT32_MAX, INT32_MIN}));
+  EXPECT_TRUE(String2IntVector("1,2", "").empty());
+  EXPECT_EQ(Hex2Dec("1aFg", 4) + Hex2Dec("100", 1) + Hex2Dec("\261@", 2), 0x1af + 1);
+  EXPECT_EQ(Hex2Dec("1FFFFFFFF", 9), -1);
+  EXPECT_EQ(urlEncoding(string("AZaz09~-._()*,/ \t\n\v\f\r!'+@[`{:\0\376\377", 32), " \t/\377"),
+            "AZaz09~-._()*,/%20%20%20%20%20%20%21%27%2B%40%5B%60%7B%3A%00%FE\377");
+  for (const Lines& Row : {Lines{"f", "Zg=="}, {"foo", "Zm9v"}, {"\373\360", "+/A="}}) {
+    const std::unique_ptr<char, decltype(&free)> pText(HttpBase64Encode(Row[0].c_str()), free);
+    EXPECT_EQ(pText.get(), Row[1]);
+  }
+  const unsigned char rgHash[] = {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 0xfe, 0xff, 1};
+  EXPECT_EQ(UnsignedHashToStr(rgHash), "000102030405060708090a0b0c0dfeff");
+  EXPECT_EQ(Trim("xyaybx", "xy") + Trim("x", "x") + Trim(" b", nullptr), "ayb b");
+  string strText("-aaaaa\0-", 8);
+  ReplaceSubstr(strText, "aa", "b");
+  ReplaceSubstr(strText, "b", "bb");
+  ReplaceSubstr(strText, "", "c");
+  StringEraseCharacter(strText, '-');
+  EXPECT_EQ(strText, string("bbbba\0", 6));
+  char szDst[] = "---------";
+  EXPECT_EQ(Strncpy(szDst, "abcdef", 4), szDst);
+  Strncpy(szDst + 4, "e", 4);
+  Strncpy(szDst, "f", 0);
+  EXPECT_EQ(string(szDst, 9), string("abc\0e\0\0\0-", 9));
+  EXPECT_EQ(GetTimeDiffUSec({12, 100000}, {10, 900000}), -1200000);
+  EXPECT_EQ(GetAbsTimeDiffUSec({12, 100000}, {10, 900000}), 1200000);
+  GetAbsTimeDiffUSec({INT64_MIN, 0}, {INT64_MAX, 999999});  // for the sanitizer
+  EXPECT_EQ(GetAbsTimeDiffBySec(5, 8) + GetAbsTimeDiffBySec(8, 5), 6.0);
+  EXPECT_EQ(GetCurTimestamp(), gClock);
+  EXPECT_EQ(GetISO8601TimeText(4102444800007999), "21000101T000000.007Z");
+  EXPECT_EQ(GetISO8601TimeText(-1500000), "19691231T235959.-500Z");
+}
+
+TEST_F(Utils, TimerCountsFromThePlannedTickUnlessItIsPastOrTheClockWentBack) {
+  DelayTimer Timer(30000);
+  // In milliseconds: what passes before a call, the interval, and what passes in the call.
+  const int rgStep[][3] = {{25, 30, 6},    {19, 30, 11}, {34, 30, 0}, {5, 30, 26},
+                           {-2126, 30, 0}, {25, 40, 16}, {29, -1, 0}};
+  for (const auto& [Before, Interval, Within] : rgStep) {
+    const int64_t usecCalled = gClock += int64_t{Before} * 1000;
+    Timer.SetDelayTime(Interval * 1000);
+    Timer.Delay();
+    EXPECT_EQ(gClock - usecCalled, Within * 1000);
+  }
+}
+
+TEST_F(Utils, WriteFdGivesUpOnErrorsAndEmptyWritesOnly) {
+  const int64_t usecStart = gClock;
+  gWrites = std::istringstream("3 0 0 -4 3 0 0 0 -11 0   1 0 0 0 0 0 9   4");  // EINTR, EAGAIN
+  EXPECT_EQ(WriteFd(-1, "0123456789", 10), 6);
+  EXPECT_EQ(WriteFd(-1, "0123456789", 10), 10);
+  EXPECT_EQ(WriteFd(-1, "0123456789", 10) + WriteFd(-1, "0123456789", -5), 4);
+  EXPECT_EQ(gClock, usecStart + 21000);
+  EXPECT_EQ(LogLines(), Lines({"[utils][notice] utils.cpp:WriteFd(): Write fd[-1] error[9]"}));
+  const string strSent = RunCommand("seq 100000 | head -c 500000").strOutput;
+  FILE* pReader = popen("sleep 0.3; cat >/var/received", "we");
+  fcntl(fileno(pReader), F_SETFL, O_NONBLOCK);
+  EXPECT_EQ(WriteFd(fileno(pReader), strSent.data(), 500000), 500000);
+  pclose(pReader);
+  EXPECT_TRUE(ReadFile("/var/received") == strSent);
+}
+
+TEST_F(Utils, ThreadIsAsAskedFor) {
+  static std::mutex Hold;  // keeps the threads from ending
+  const ThreadFunc pFunc = [](void* pParam) {
+    const std::lock_guard<std::mutex> Guard(*static_cast<std::mutex*>(pParam));
+    return pParam;
+  };
+  pthread_t Thread;
+  for (const bool blDetach : {false, true}) {
+    size_t Size = 0;
+    int State = -1;
+    pthread_attr_t Attr;
+    Hold.lock();
+    EXPECT_TRUE(CreateThread(pFunc, &Hold, 16 << 20, blDetach, Thread));
+    pthread_getattr_np(Thread, &Attr);
+    pthread_attr_getstacksize(&Attr, &Size);
+    pthread_attr_getdetachstate(&Attr, &State);
+    pthread_attr_destroy(&Attr);
+    Hold.unlock();
+    EXPECT_EQ(Size >> 20, 16u);
+    EXPECT_TRUE(blDetach ? State == PTHREAD_CREATE_DETACHED : pthread_join(Thread, nullptr) == 0);
+  }
+  EXPECT_TRUE(CreateThread(pFunc, &Hold, 1, true, Thread));
+  RunCommand("prlimit -p $PPID -v$(($(cut -d' ' -f1 /proc/$PPID/statm) * 4096 + (1 << 30))):");
+  EXPECT_FALSE(CreateThread(pFunc, &Hold, 0xfffff000, true, Thread));  // no room for 4 GiB
+  EXPECT_EQ(LogLines().at(0), "[utils][error] utils.cpp:CreateThread(): Failed to create thread.");
+}
+
+}  // namespace
