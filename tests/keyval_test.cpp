@@ -169,7 +169,7 @@ TEST_F(KeyVal, CancelledThreadFinishesWhatItBegan) {
   Shell("mount --bind f f");
   CancelWaiting(NAME, [] { EXPECT_EQ(KiFileSetVal(NAME, "c", "3", false), -1); });
   EXPECT_EQ(Shell("ls; cat f; umount f"), "f\na=1\nb=2\n");
-  CancelWaiting(LOG_FILE, [] { KiPrintf(KI_LOG, nullptr, nullptr, "f", 1, "Fn", "x\n"); });
+  CancelWaiting(LOG_FILE.c_str(), [] { KiPrintf(KI_LOG, nullptr, nullptr, "f", 1, "Fn", "x\n"); });
   EXPECT_EQ(LogLines().size(), 2u);
 }
 
