@@ -419,13 +419,14 @@ static int UpdateReolinkRLC411And423Series() {
 
 // --- Capability files ---
 
-// The value of strKey, or nothing when there is none or it cannot be read.
-static std::string GetConfKeyValue(const std::string& strFilePath, const std::string& strKey) {
+// The value of strKey, or nothing when there is none or, which sets *pblUnread, it cannot be read.
+static std::string GetConfKeyValue(const std::string& strFilePath, const std::string& strKey,
+                                   bool* pblUnread) {
   char szValue[512] = "";
-  if (ZAMOCFileGetKeyValue(strFilePath.c_str(), strKey.c_str(), szValue, sizeof(szValue), 0) <= 0) {
-    return "";
-  }
-  return szValue;
+  const int Len =
+      ZAMOCFileGetKeyValue(strFilePath.c_str(), strKey.c_str(), szValue, sizeof(szValue), 0);
+  *pblUnread = *pblUnread || Len < 0;
+  return Len > 0 ? szValue : "";
 }
 
 struct DirCloser {
@@ -457,35 +458,41 @@ static int ForEachCapFile(int (*pUpgradeFile)(const std::string& strFilePath)) {
   return 0;
 }
 
-// A file's changes are made in one replacement: a run that is cut off between the marker and the
-// axes would let the next one take a continuous axis for a stepping one.
+// A file's changes are made in one replacement, and only when all of its keys could be read: a file
+// that is left between the marker and the axes would let the next run take a continuous axis for a
+// stepping one.
 static int UpgradeOnvifConfForPtzContinuousMove() {
   return ForEachCapFile([](const std::string& strFilePath) {
     std::vector<ZAMOCKeyChange> Changes;
-    const bool blPtzContinuousMove = GetConfKeyValue(strFilePath, "ptz_continuous_move") == "yes";
+    bool blUnread = false;
+    const bool blPtzContinuousMove =
+        GetConfKeyValue(strFilePath, "ptz_continuous_move", &blUnread) == "yes";
     if (blPtzContinuousMove) {
       Changes.push_back({"ptz_continuous_move", nullptr, nullptr});
     }
     for (const char* szAxis : {"pan", "tilt", "zoom"}) {
-      if (GetConfKeyValue(strFilePath, szAxis) == "yes") {
+      if (GetConfKeyValue(strFilePath, szAxis, &blUnread) == "yes") {
         Changes.push_back({szAxis, blPtzContinuousMove ? "continuous" : "step", "%s= %s\n"});
       }
     }
     if (Changes.empty()) {
       return 0;
     }
-    const int Err = ZAMOCFileChangeKeys(strFilePath.c_str(), Changes.data(), Changes.size());
+    const int Err =
+        blUnread ? -1 : ZAMOCFileChangeKeys(strFilePath.c_str(), Changes.data(), Changes.size());
     return blPtzContinuousMove ? Err : 0;  // only the marker's removal has to succeed
   });
 }
 
 static int UpgradeOnvifConfForContinuousPtzSpeed() {
   return ForEachCapFile([](const std::string& strFilePath) {
-    if (!GetConfKeyValue(strFilePath, "ptz_speed_max").empty()) {
+    bool blUnread = false;
+    // A speed that is there but cannot be read must not be replaced.
+    if (!GetConfKeyValue(strFilePath, "ptz_speed_max", &blUnread).empty() || blUnread) {
       return 0;
     }
-    const bool blSupportPtzSpeed = GetConfKeyValue(strFilePath, "pan") == "continuous" ||
-                                   GetConfKeyValue(strFilePath, "tilt") == "continuous";
+    const bool blSupportPtzSpeed = GetConfKeyValue(strFilePath, "pan", &blUnread) == "continuous" ||
+                                   GetConfKeyValue(strFilePath, "tilt", &blUnread) == "continuous";
     if (blSupportPtzSpeed) {
       ZAMOCFileSetKeyValue(strFilePath.c_str(), "ptz_speed_max", "1", "%s = %s\n");
     }
