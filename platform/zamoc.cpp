@@ -134,6 +134,11 @@ File OpenRegular(const char* szFile) {
   return pFile;
 }
 
+// Whether it is the name, and no failure, that kept OpenRegular from opening.
+bool HoldsNoKeys(int Errno) {
+  return Errno == EINVAL || Errno == EFBIG || Errno == ENOENT || Errno == ELOOP;
+}
+
 // --- Lines ---
 
 // Reads a file line by line; a line keeps its line feed and may hold any bytes.
@@ -340,12 +345,12 @@ int ZAMOCFileGetKeyValue(const char* szFile, const char* szKey, char* szValue, s
   szValue[0] = '\0';
   const File pFile = OpenRegular(szFile);
   if (pFile == nullptr) {
-    return -1;
+    return HoldsNoKeys(errno) ? -1 : ReportFailure(szFile, "open");
   }
   std::string strValue;
   const int Found = FindKey(pFile.get(), szKey, &strValue);
   if (Found <= 0) {
-    return Found;
+    return Found == 0 ? 0 : ReportFailure(szFile, "read");
   }
   strValue.copy(szValue, Size - 1);
   szValue[std::min(strValue.size(), Size - 1)] = '\0';

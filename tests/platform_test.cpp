@@ -130,6 +130,13 @@ TEST_F(CapabilityFile, OneKeyIsReadSetAndRemovedAndNoOtherByteChanges) {
   }
 }
 
+TEST_F(CapabilityFile, FailedReadIsAnErrorAndReported) {
+  SyslogSocket Syslog;
+  m_strFile = "/proc/self/mem";
+  EXPECT_EQ(Get("k"), "-1 ");
+  EXPECT_EQ(Syslog.Stop(), Lines{"<11> zamoc: [/proc/self/mem]: read failed with errno [5]"});
+}
+
 TEST_F(CapabilityFile, ReplacementKeepsOwnerModeAndLink) {
   const string strStat = CD + "readlink file; stat -Lc '%a %u %g' file";
   // An ordinary user's namespace knows no second owner.
