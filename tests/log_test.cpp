@@ -51,8 +51,8 @@ TEST_F(Log, LostLinesGoToSyslog) {
 TEST_F(Log, LinesOfTwoProcessesStayWholeAndInOrder) {
   string strWritten;
   const pid_t Pid = fork();
-  for (size_t Line = 0; Line < 10000; ++Line) {
-    const string strLine = itos(Line) + string(Line % 300, '.') + "\n";
+  for (int Line = 0; Line < 10000; ++Line) {
+    const string strLine = itos(Line) + string(static_cast<size_t>(Line % 300), '.') + "\n";
     KiPrintf(KI_LOG, nullptr, nullptr, "f", 1, "Fn", "%s", strLine.c_str());
     strWritten += strLine;
   }

@@ -153,7 +153,7 @@ TEST_F(CapabilityFile, FailureLeavesTheFileAndNothingElse) {
   // What a killed process left is no capability file, and goes with the next change.
   RunCommand(CD + "mkfifo fifo; mkdir dir; echo k=1 | tee .tesselupgrader.tmp >file");
   for (const string strName : {"none", "dir", "fifo", ".tesselupgrader.tmp", "file"}) {
-    m_strFile = CAP_DIR + "/" + strName;
+    m_strFile.assign(CAP_DIR).append("/").append(strName);
     EXPECT_EQ(Get("k"), strName == "file" ? "1 1" : "-1 ") << strName;
     EXPECT_EQ(Set("k", "2") + Remove("none"), strName == "file" ? 0 : -2) << strName;
   }

@@ -46,7 +46,7 @@ class Upgrade : public Appliance {
         AddFailure(&Log, "execute db[0] cmd: BEGIN;" + Row[End] + ";COMMIT;.", Action[1], Row[End]);
       }
     }
-    const string strChanges = "\n" + Sql(EXPECTED_DB, strTexts + Case.back());
+    string strChanges = "\n" + Sql(EXPECTED_DB, strTexts + Case.back());
     Sql(SYSTEM_DB, Case.back());
     EXPECT_EQ(RunTool(std::to_string(Version)).Status, Case.back().empty() ? 0 : 255);
     EXPECT_EQ(Sql(SYSTEM_DB, ".dump"), Sql(EXPECTED_DB, ".dump")) << Version << Case.back();
