@@ -14,9 +14,8 @@
 #include "delaytimer.h"
 #include "rig.h"
 
-// In the place of libc's: the clock moves only in sleeps, which signals interrupt and which end 1
-// ms late; a write gives the next number of gWrites, bytes taken or a negative errno, if there is
-// one.
+// In the place of libc's: the clock moves in sleeps only, which signals interrupt and which end 1
+// ms late; a write gives the next of gWrites, bytes taken or a negative errno, until all are used.
 static int64_t gClock = 1000800000;
 static std::istringstream gWrites;
 
