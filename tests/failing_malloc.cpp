@@ -1,0 +1,23 @@
+// Preloaded into a program: lets allocation number FAILING_ALLOCATION fail, or says at the end how
+// many there were.
+
+#include <atomic>
+#include <cerrno>
+#include <cstddef>
+#include <cstdio>
+#include <cstdlib>
+
+static const char* const gszFailing = getenv("FAILING_ALLOCATION");
+static std::atomic<long> gCount;
+
+extern "C" void* __libc_realloc(void* pOld, size_t Size);
+
+extern "C" void* realloc(void* pOld, size_t Size) {
+  const bool blFails = ++gCount == (gszFailing == nullptr ? 0 : atol(gszFailing));
+  errno = blFails ? ENOMEM : errno;
+  return blFails ? nullptr : __libc_realloc(pOld, Size);
+}
+
+extern "C" void* malloc(size_t Size) { return realloc(nullptr, Size); }
+
+__attribute__((destructor)) static void Tell() { fprintf(stderr, "%ld\n", gCount.load()); }
