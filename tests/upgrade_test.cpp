@@ -68,6 +68,48 @@ TEST_F(Upgrade, FailedTextIsUndoneWholeAndEndsItsAction) {
   }
 }
 
+// A row makes another database of the example's, or lets the recorder hold it. The sqlite3 shell
+// says what a run must make of it, one text of an action after the other until one fails; the names
+// of actions that fail at once may be given.
+TEST_F(Upgrade, HostileDatabases) {
+  for (const Lines& Row : ReadTable("databases.tsv")) {
+    StartOver();
+    RunCommand("D=" + SYSTEM_DB + "; rm -f /var/held; " + Row[2] + "; cp $D " + EXPECTED_DB);
+    for (const Lines& Action : m_Actions) {
+      int Status = std::regex_match(Action[1], std::regex(Row[3])) ? 1 : 0;
+      for (size_t Text = 2; Status == 0 && Text < Action.size(); ++Text) {
+        const string strTransaction = "BEGIN;" + Action[Text] + ";COMMIT;";
+        Status = RunCommand("sqlite3 -bail " + EXPECTED_DB + " \"" + strTransaction + "\"").Status;
+      }
+    }
+    EXPECT_EQ(RunTool(Row[0]).Status, std::stoi(Row[1])) << Row[2];
+    EXPECT_EQ(RunCommand("sqlite3 file:" + SYSTEM_DB + "?nolock=1 .dump").strOutput,
+              RunCommand("sqlite3 " + EXPECTED_DB + " .dump").strOutput)
+        << Row[2];
+    EXPECT_EQ(RunCommand("grep -q 'error.$' " + LOG_FILE).Status, Row[1] == "0" ? 1 : 0) << Row[2];
+  }
+}
+
+TEST_F(Upgrade, CorruptPageIsAnErrorOrDoesNotMatter) {
+  StartOver();
+  RunTool("0");
+  const string strDump = "sqlite3 " + SYSTEM_DB + " '.dump cam%'";
+  WriteFile("/var/upgraded.sql", RunCommand(strDump).strOutput);
+  const auto Pages = static_cast<int>(fs::file_size("/var/start.db") / 4096);
+  for (int Page = 0; Page < 2 * Pages; ++Page) {
+    const string strFill = Page < Pages ? "tr '\\0' '\\377' </dev/zero" : "cat /dev/urandom";
+    StartOver();
+    RunCommand(strFill + " | dd of=" + SYSTEM_DB +
+               " bs=4096 count=1 iflag=fullblock conv=notrunc " + "seek=" + itos(Page % Pages));
+    const int Status = RunTool("0").Status;
+    const string strCheck =
+        Status == 0 ? strDump + " | diff - /var/upgraded.sql" : "grep -q 'error.$' " + LOG_FILE;
+    EXPECT_TRUE(Status == 0 || Status == 255) << Page;
+    EXPECT_EQ(RunCommand(strCheck).Status, 0) << Page;
+    EXPECT_FALSE(fs::exists(SYSTEM_DB + "-journal")) << Page;
+  }
+}
+
 TEST_F(Upgrade, WithoutDatabaseEachActionFailsOnce) {
   Lines Log = {VERSION_LINE + "0"};
   for (const Lines& Action : m_Actions) {
@@ -98,13 +140,26 @@ TEST_F(Upgrade, CapabilityFilesChangeByTheirOwnKeys) {
   const string strDir = "/var/" + string(250, 'a') + "/" + string(255, 'b');
   const string strCd = "mkdir -p " + strDir + "/dir; cd " + strDir + "; ";
   RunCommand(strCd +
-             "echo pan=yes | tee a c >/var/pan; echo ptz_continuous_move=yes | cat - a >b; "
-             "mkfifo fifo; ln -s /var/pan link; ln -s /dev/zero device; ln -s loop loop; ln -s "
-             "none dangling");
+             "echo pan=yes | tee a c \"new\nline\" $(printf %0255d) >/var/pan; mkfifo fifo; "
+             "echo ptz_continuous_move=yes | cat - a >b; { head -c 99999 /dev/urandom | tr = x; "
+             "echo; cat b; } >binary; truncate -s 100M big; chmod 400 a; ln -s /var/pan link; "
+             "ln -s /dev/zero device; ln -s loop loop; ln -s none dangling");
+  const string strBinary = "head -n -3 binary | md5sum",
+               strBefore = RunCommand(strCd + strBinary).strOutput;
   EXPECT_EQ(RunTool("--updateCap " + strDir + "x").Status, 0);
-  EXPECT_EQ(RunCommand(strCd + "ls -AF; cat a b c link; ls /var/log/camveld").strOutput,
-            "a\nb\nc\ndangling@\ndevice@\ndir/\nfifo|\nlink@\nloop@\n"
-            "pan= step\npan= continuous\nptz_speed_max = 1\npan= step\npan= step\n");
+  EXPECT_EQ(RunCommand(strCd + strBinary).strOutput, strBefore);
+  EXPECT_EQ(RunCommand(strCd + "ls -AF; cat a 0* b c link new*; ls /var/log/camveld").strOutput,
+            string(255, '0') + "\na\nb\nbig\nbinary\nc\ndangling@\ndevice@\ndir/\nfifo|\nlink@\n" +
+                "loop@\nnew\nline\npan= step\npan= step\npan= continuous\nptz_speed_max = 1\n" +
+                "pan= step\npan= step\npan= step\n");
+}
+
+TEST_F(Upgrade, LargeCapabilityDirectoryThatOthersChange) {
+  RunCommand("cd " + CAP_DIR + "; seq 100000 | xargs touch; echo pan=yes | tee a z >/dev/null; " +
+             "while [ -e a ]; do echo pan=yes >b; mv b c; rm c; done &");
+  EXPECT_EQ(RunTool("--updateCap " + CAP_DIR).Status, 0);
+  EXPECT_EQ(RunCommand("cd " + CAP_DIR + "; cat a z; rm a; wait; ls | wc -l").strOutput,
+            "pan= step\npan= step\n100001\n");
 }
 
 TEST_F(Upgrade, WritesOnlyItsFilesAndThoseInAnOrderThatLasts) {
