@@ -65,28 +65,6 @@ TEST_F(Database, RunsEachStatementUntilOneFailsForAReportedReason) {
   }
 }
 
-TEST_F(Database, ShortLockPassesAndALongOneFails) {
-  const string strHold = "rm -f /var/held; sqlite3 " + SYSTEM_DB + " 'BEGIN EXCLUSIVE' ";
-  for (const int Seconds : {1, 8}) {
-    RunCommand(strHold + "'.shell touch /var/held; sleep " + itos(Seconds) + "' & " +
-               "until [ -e /var/held ]; do sleep 0.01; done");
-    EXPECT_EQ(Run("DELETE FROM t"), Seconds == 1 ? "0" : "-1");
-  }
-}
-
-TEST_F(Database, HotJournalsAndWalWorkAndStayAsTheyAre) {
-  const string strShell = "sqlite3 " + SYSTEM_DB, strDie = " '.shell kill -KILL $PPID'";
-  // A spilled cache puts half of a transaction into the file before its process dies.
-  RunCommand(strShell + " 'PRAGMA cache_size=1; BEGIN; INSERT INTO t SELECT * FROM " +
-             "generate_series(100,5000)'" + strDie);
-  EXPECT_GT(fs::file_size(SYSTEM_DB + "-journal"), 0u);
-  EXPECT_EQ(Run("INSERT INTO t VALUES (2)"), "0");
-  EXPECT_EQ(Rows(), "1,2\n");
-  RunCommand(strShell + " 'PRAGMA journal_mode=WAL; INSERT INTO t VALUES (3)'" + strDie);
-  EXPECT_EQ(Run("INSERT INTO t VALUES (4)"), "0");
-  EXPECT_EQ(Rows() + Sql(SYSTEM_DB, "PRAGMA journal_mode"), "1,2,3,4\nwal\n");
-}
-
 TEST_F(Database, ExecuteReplacesBooleansAndHandsResultsOver) {
   const string strQuery = "SELECT 'TRUEfalseFALSEtruetrueTrue' n";
   DBResult* pResult = nullptr;
