@@ -48,22 +48,47 @@ TEST_F(Log, LostLinesGoToSyslog) {
   EXPECT_FALSE(fs::exists("/var/log/camveld"));
 }
 
-TEST_F(Log, LinesOfTwoProcessesStayWholeAndInOrder) {
-  string strWritten;
-  const pid_t Pid = fork();
-  for (int Line = 0; Line < 10000; ++Line) {
-    const string strLine = itos(Line) + string(static_cast<size_t>(Line % 300), '.') + "\n";
-    KiPrintf(KI_LOG, nullptr, nullptr, "f", 1, "Fn", "%s", strLine.c_str());
-    strWritten += strLine;
+// While the log is rotated and some of the writers are killed.
+TEST_F(Log, LinesOf64WritersStayWholeAndInOrder) {
+  RunProgram(TESSEL_CLIENT, "create");
+  InitDbgCfg();
+  g_pDbgLogCfg->SetLogInMs(true);
+  WriteFile("/var/conf", LOG_FILE + " {\nrotate 1000\nnocreate\nmissingok\n}\n");
+  const auto WriteLines = [](int Thread) {
+    for (int Line = 0; Line < 1000; ++Line) {
+      KiPrintf(KI_LOG, nullptr, nullptr, "f", Thread, "Fn", "%d %0*d\n", Line, Line % 300 + 1, 0);
+    }
+  };
+  string strAlive = "grep", strExpected;
+  for (int Process = 0; Process < 16; ++Process) {
+    const pid_t Pid = fork();
+    if (Pid == 0) {
+      std::thread Threads[] = {std::thread(WriteLines, 0), std::thread(WriteLines, 1),
+                               std::thread(WriteLines, 2), std::thread(WriteLines, 3)};
+      for (std::thread& Thread : Threads) {
+        Thread.join();
+      }
+      _exit(0);
+    }
+    if (Process % 4 == 0) {
+      usleep(10000);
+      kill(Pid, SIGKILL);
+    } else {
+      strAlive += " -e ' " + itos(Pid) + " '";
+      strExpected += "4 " + itos(Pid) + " 1000\n";
+    }
   }
-  if (Pid == 0) {
-    _exit(0);
+  while (waitpid(-1, nullptr, WNOHANG) != -1) {
+    EXPECT_EQ(RunCommand("sleep 0.1; logrotate -f -s /var/state /var/conf").strOutput, "");
   }
-  waitpid(Pid, nullptr, 0);
-  for (const pid_t Writer : {Pid, getpid()}) {
-    const string strSed = "sed -n 's/^[A-Z].\\{14\\} \\[" + itos(Writer) + "\\] f:1:Fn(): //p' ";
-    EXPECT_EQ(RunCommand(strSed + LOG_FILE).strOutput, strWritten);
-  }
+  EXPECT_EQ(KiFlock(LOG_FILE).LockEx(0), 0);
+  const string strCheck = R"(cd /var/log/camveld
+    for file in *; do cut -c 1-19 $file | sort -c; done
+    cat $(ls -rv) | sed -E 's/^.{19} \[([0-9]+)]\[[0-9]+] f:([0-3]):Fn\(\): /\1 \2 /' |
+      awk '$3 + 0 != next_of[$1, $2]++ || length($4) != $3 % 300 + 1 || NF != 4
+        END { for (writer in next_of) print substr(writer, 1, length(writer) - 2), next_of[writer] }' |
+      sort -n | uniq -c | sed 's/^ *//' | )";
+  EXPECT_EQ(RunCommand(strCheck + strAlive).strOutput, strExpected);
 }
 
 TEST_F(Log, HeldLogDelaysTheToolAndLosesNothing) {
