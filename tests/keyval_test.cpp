@@ -120,6 +120,7 @@ TEST_F(KeyVal, OwnerAndGroupStayOrTheUpdateFails) {
 }
 
 TEST_F(KeyVal, NoUpdateIsLostAndNoReaderSeesHalfAFile) {
+  RunCommand("prlimit -p $PPID -n64");  // too few for one that is left open each time
   EXPECT_EQ(KiFileSetVal(NAME, "z", "end", false), 0);
   for (int Writer = 0; Writer < 8; ++Writer) {
     if (fork() == 0) {
