@@ -239,9 +239,11 @@ void Utils(const string& strSet, const string& strNew, const string& strText) {
   const std::unique_ptr<char, decltype(&free)> pBase64(HttpBase64Encode(strText.c_str()), free);
   Check(pBase64.get() == strBase64);
 
-  const string strHex = strText.substr(0, strText.find_first_not_of("0123456789abcdefABCDEF"));
+  const string strStart = strText.substr(0, strSet.size());
+  const string strHex = strStart.substr(0, strStart.find_first_not_of("0123456789abcdefABCDEF"));
   const auto Low = std::stoul(("00000000" + strHex).substr(strHex.size()), nullptr, 16);
-  Check(Hex2Dec(strText.data(), static_cast<int32_t>(strText.size())) == static_cast<int32_t>(Low));
+  Check(Hex2Dec(strText.data(), static_cast<int32_t>(strStart.size())) ==
+        static_cast<int32_t>(Low));
 
   char szBuffer[9] = "xxxxxxxx";
   string strCopy = strZero.substr(0, std::max(strSet.size(), size_t{1}) - 1);
