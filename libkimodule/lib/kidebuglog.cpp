@@ -174,23 +174,9 @@ void KiDbgPrintf(LOG_CATEG Categ, LOG_LEVEL Level, const char* szFile, int LineN
 
 namespace {
 
-// Other processes read and write meanwhile: each access is one that the compiler can neither split
-// nor leave out.
-template <typename T>
-T Load(const T& Field) {
-  return __atomic_load_n(&Field, __ATOMIC_RELAXED);
-}
-
-template <typename T>
-void Store(T& Field, T Value) {
-  __atomic_store_n(&Field, Value, __ATOMIC_RELAXED);
-}
-
 constexpr const char* SETTINGS_FILE = "/var/packages/Camveld/etc/settings.conf";
 constexpr const char* LEVELS_KEY = "ki_dbglog_settings";  // by category, parted by commas
 constexpr const char* IN_MS_KEY = "ki_dbglog_time_scale";
-
-bool IsCateg(LOG_CATEG Categ) { return Categ >= 0 && Categ < LOG_CATEG_MAX; }
 
 }  // namespace
 
@@ -231,10 +217,6 @@ int KiDbgLogCfg::SaveDbgLogSettings() const {
                        {{LEVELS_KEY, strLevels}, {IN_MS_KEY, LogInMs() ? "yes" : "no"}}, true);
 }
 
-LOG_LEVEL KiDbgLogCfg::GetLogLevel(LOG_CATEG Categ) const {
-  return IsCateg(Categ) ? Load(m_LogLevels[Categ]) : LOG_LEVEL_ALARM;
-}
-
 void KiDbgLogCfg::SetLogLevel(LOG_CATEG Categ, LOG_LEVEL Level) {
   if (IsCateg(Categ)) {
     Store(m_LogLevels[Categ], Level);
@@ -245,7 +227,7 @@ bool KiDbgLogCfg::LogInMs() const { return Load(m_blLogInMs) != 0; }
 
 void KiDbgLogCfg::SetLogInMs(bool blLogInMs) { Store<uint8_t>(m_blLogInMs, blLogInMs ? 1 : 0); }
 
-LOG_LEVEL KiDbgLogCfg::GetPidLevel(pid_t Pid) const {
+LOG_LEVEL KiDbgLogCfg::FindPidLevel(pid_t Pid) const {
   const int Idx = FindPid(Pid, UsedPids());
   return Idx == -1 ? LOG_LEVEL_ALARM : Load(m_PidLevels[Idx].Level);
 }

@@ -92,7 +92,9 @@ class KiDbgLogCfg {
   int SaveDbgLogSettings() const;
 
   // LOG_LEVEL_ALARM for a category outside 0 to LOG_CATEG_MAX - 1, whose threshold cannot be set.
-  LOG_LEVEL GetLogLevel(LOG_CATEG Categ) const;
+  LOG_LEVEL GetLogLevel(LOG_CATEG Categ) const {
+    return IsCateg(Categ) ? Load(m_LogLevels[Categ]) : LOG_LEVEL_ALARM;
+  }
   void SetLogLevel(LOG_CATEG Categ, LOG_LEVEL Level);
 
   // Whether the times of log lines carry milliseconds.
@@ -100,7 +102,9 @@ class KiDbgLogCfg {
   void SetLogInMs(bool blLogInMs);
 
   // The threshold of process Pid, LOG_LEVEL_ALARM when it has none of its own.
-  LOG_LEVEL GetPidLevel(pid_t Pid) const;
+  LOG_LEVEL GetPidLevel(pid_t Pid) const {
+    return Load(m_PidCnt) == 0 ? LOG_LEVEL_ALARM : FindPidLevel(Pid);
+  }
 
   // Gets entry Idx of the process table, counted from 0 in the order in which they were added.
   // Returns 0, or -1 with Pid and Level as they were when there is no such entry.
@@ -114,6 +118,20 @@ class KiDbgLogCfg {
   static constexpr int MAX_PIDS = 64;
   struct Layout;
 
+  static bool IsCateg(LOG_CATEG Categ) { return Categ >= 0 && Categ < LOG_CATEG_MAX; }
+
+  // Other processes read and write meanwhile: each access is one that the compiler can neither
+  // split nor leave out.
+  template <typename T>
+  static T Load(const T& Field) {
+    return __atomic_load_n(&Field, __ATOMIC_RELAXED);
+  }
+  template <typename T>
+  static void Store(T& Field, T Value) {
+    __atomic_store_n(&Field, Value, __ATOMIC_RELAXED);
+  }
+
+  LOG_LEVEL FindPidLevel(pid_t Pid) const;
   int UsedPids() const;
   int FindPid(pid_t Pid, int Count) const;
   void SetUsedPids(int Count);
