@@ -3,12 +3,14 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <cmath>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <string_view>
 
 #include "delaytimer.h"
 #include "kidebuglog.h"
@@ -57,19 +59,25 @@ int32_t Hex2Dec(const char* pHex, int32_t Len) {
 }
 
 std::string urlEncoding(const std::string& strInput, const std::string& strExtraUrlUnencodedChars) {
-  static const std::string strUnencoded =
-      "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789_~()*,-.";
-  static const std::string strWhite = " \t\n\v\f\r";
+  enum KIND : unsigned char { ENCODED, UNENCODED, WHITE };
+  std::array<KIND, 256> Kinds = {};
+  const auto Set = [&Kinds](std::string_view Characters, KIND Kind) {
+    for (const char Character : Characters) {
+      Kinds[static_cast<unsigned char>(Character)] = Kind;
+    }
+  };
+  Set("ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789_~()*,-.", UNENCODED);
+  Set(strExtraUrlUnencodedChars, UNENCODED);
+  Set(" \t\n\v\f\r", WHITE);
+
   std::string strOutput;
+  strOutput.reserve(strInput.size());
   for (const char Character : strInput) {
-    const auto IsIn = [&](const std::string& strSet) {
-      return strSet.find(Character) != std::string::npos;
-    };
     const auto Byte = static_cast<unsigned char>(Character);
-    if (IsIn(strWhite)) {
-      strOutput += "%20";
-    } else if (IsIn(strUnencoded) || IsIn(strExtraUrlUnencodedChars)) {
+    if (Kinds[Byte] == UNENCODED) {
       strOutput += Character;
+    } else if (Kinds[Byte] == WHITE) {
+      strOutput += "%20";
     } else {
       strOutput += {'%', toHex(Byte >> 4), toHex(Byte & 15)};
     }
