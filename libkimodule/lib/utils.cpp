@@ -126,24 +126,32 @@ void ReplaceSubstr(std::string& strInput, const std::string& strSub,
 char* HttpBase64Encode(const char* src) {
   static const char szAlphabet[] =
       "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
+  // The two characters of each twelve bits.
+  static const auto Pairs = [] {
+    std::array<std::array<char, 2>, 4096> Made;
+    for (size_t Bits = 0; Bits < Made.size(); ++Bits) {
+      Made[Bits] = {szAlphabet[Bits >> 6], szAlphabet[Bits & 63]};
+    }
+    return Made;
+  }();
   const size_t Len = strlen(src);
   char* const szText = static_cast<char*>(malloc((Len + 2) / 3 * 4 + 1));
   if (szText == nullptr) {
     return nullptr;
   }
   char* pOut = szText;
-  for (size_t Done = 0; Done < Len; Done += 3) {
-    const size_t Left = Len - Done;
-    const auto Byte = [&](size_t Idx) {
-      return Idx < Left ? static_cast<unsigned char>(src[Done + Idx]) : 0u;
-    };
-    const unsigned Group = Byte(0) << 16 | Byte(1) << 8 | Byte(2);
-    *pOut++ = szAlphabet[Group >> 18];
-    *pOut++ = szAlphabet[Group >> 12 & 63];
-    *pOut++ = Left > 1 ? szAlphabet[Group >> 6 & 63] : '=';
-    *pOut++ = Left > 2 ? szAlphabet[Group & 63] : '=';
+  for (size_t Done = 0; Done < Len; Done += 3, pOut += 4) {
+    const auto* pIn = reinterpret_cast<const unsigned char*>(src + Done);
+    const unsigned First = pIn[0];
+    const unsigned Second = pIn[1];
+    const unsigned Third = Done + 1 < Len ? pIn[2] : 0;  // the NUL stands for what is not there
+    memcpy(pOut, Pairs[First << 4 | Second >> 4].data(), 2);
+    memcpy(pOut + 2, Pairs[(Second & 15) << 8 | Third].data(), 2);
   }
   *pOut = '\0';
+  for (size_t Pad = Len; Pad % 3 != 0; ++Pad) {
+    *--pOut = '=';
+  }
   return szText;
 }
 
