@@ -9,6 +9,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <memory>
+#include <string_view>
 
 #include "kidebuglog.h"
 #include "kiflock.h"
@@ -31,18 +32,16 @@ struct LineBuffer {
 
 // Takes a line, without its line feed, apart. Returns -1 with both outputs as they were when it
 // carries no pair.
-int ParseKeyVal(const std::string& strLine, std::string& strKey, std::string& strVal) {
-  const size_t Equal = strLine.find('=');
-  if (Equal == std::string::npos) {
+int ParseKeyVal(std::string_view Line, std::string_view& Key, std::string_view& Val) {
+  const size_t Equal = Line.find('=');
+  if (Equal == std::string_view::npos) {
     return -1;
   }
-  strKey = strLine.substr(0, Equal);
-  const size_t Open = strLine.find('"', Equal + 1);
-  const size_t Close = strLine.rfind('"');
-  if (Open != std::string::npos && Open < Close) {
-    strVal = strLine.substr(Open + 1, Close - Open - 1);
-  } else {
-    strVal = strLine.substr(Equal + 1);
+  Key = Line.substr(0, Equal);
+  Val = Line.substr(Equal + 1);
+  const size_t Open = Val.find('"');
+  if (Open != std::string_view::npos && Open < Val.rfind('"')) {
+    Val = Val.substr(Open + 1, Val.rfind('"') - Open - 1);
   }
   return 0;
 }
@@ -52,21 +51,24 @@ int ParseKeyVal(const std::string& strLine, std::string& strKey, std::string& st
 // errno of a read that failed.
 int ReadKeyVals(FILE* pFile, const KEY_SET* pKeys, KEY_VAL_MAP& KeyVals, int& Match) {
   LineBuffer Buffer;
+  std::string_view Key;
+  std::string_view Val;
   std::string strKey;
-  std::string strVal;
   for (ssize_t Len; (Len = getline(&Buffer.szLine, &Buffer.Size, pFile)) > 0;) {
-    std::string strLine(Buffer.szLine, static_cast<size_t>(Len));
-    if (strLine.back() == '\n') {
-      strLine.pop_back();
+    std::string_view Line(Buffer.szLine, static_cast<size_t>(Len));
+    if (Line.back() == '\n') {
+      Line.remove_suffix(1);
     } else if (feof(pFile) == 0) {
       break;  // the part of a line before a failed read
     }
-    if (ParseKeyVal(strLine, strKey, strVal) != 0 ||
-        (pKeys != nullptr && pKeys->count(strKey) == 0)) {
+    if (ParseKeyVal(Line, Key, Val) != 0) {
       continue;
     }
-    KeyVals.emplace(strKey, strVal);
-    ++Match;
+    strKey = Key;
+    if (pKeys == nullptr || pKeys->count(strKey) != 0) {
+      KeyVals.try_emplace(KeyVals.end(), strKey, Val);  // at the end if they are in order
+      ++Match;
+    }
   }
   const int Errno = errno;
   return feof(pFile) != 0 ? 0 : Errno;
