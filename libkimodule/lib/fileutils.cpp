@@ -46,19 +46,26 @@ int ParseKeyVal(std::string_view Line, std::string_view& Key, std::string_view& 
   return 0;
 }
 
-// Puts the pairs of the lines that are left into KeyVals, unless their keys are there already, and
-// adds the number of those lines to Match; with a pKeys, only its keys count. Returns 0, or the
-// errno of a read that failed.
-int ReadKeyVals(FILE* pFile, const KEY_SET* pKeys, KEY_VAL_MAP& KeyVals, int& Match) {
+// Puts the pairs of szFile into KeyVals, unless their keys are there already, and puts the number
+// of their lines in Match, which is left alone when the file cannot be opened; with a pKeys, only
+// its keys count. Returns 0, or the errno of the open or of a read that failed.
+int ReadKeyVals(const char* szFile, const KEY_SET* pKeys, KEY_VAL_MAP& KeyVals, int& Match) {
+  char rgBuf[4096];  // outlives the stream, which would else ask the system how large to make one
+  const File pFile(fopen(szFile, "re"));
+  if (pFile == nullptr) {
+    return errno;
+  }
+  setvbuf(pFile.get(), rgBuf, _IOFBF, sizeof(rgBuf));
+  Match = 0;
   LineBuffer Buffer;
   std::string_view Key;
   std::string_view Val;
   std::string strKey;
-  for (ssize_t Len; (Len = getline(&Buffer.szLine, &Buffer.Size, pFile)) > 0;) {
+  for (ssize_t Len; (Len = getline(&Buffer.szLine, &Buffer.Size, pFile.get())) > 0;) {
     std::string_view Line(Buffer.szLine, static_cast<size_t>(Len));
     if (Line.back() == '\n') {
       Line.remove_suffix(1);
-    } else if (feof(pFile) == 0) {
+    } else if (feof(pFile.get()) == 0) {
       break;  // the part of a line before a failed read
     }
     if (ParseKeyVal(Line, Key, Val) != 0) {
@@ -71,7 +78,7 @@ int ReadKeyVals(FILE* pFile, const KEY_SET* pKeys, KEY_VAL_MAP& KeyVals, int& Ma
     }
   }
   const int Errno = errno;
-  return feof(pFile) != 0 ? 0 : Errno;
+  return feof(pFile.get()) != 0 ? 0 : Errno;
 }
 
 // Adds to KeyVals what it does not hold yet.
@@ -82,14 +89,12 @@ int GetKeyVals(const char* szFile, const KEY_SET* pKeys, KEY_VAL_MAP& KeyVals) {
              errno);
     return -1;
   }
-  const File pFile(fopen(szFile, "re"));
-  if (pFile == nullptr) {
+  int Match = -1;
+  const int Errno = ReadKeyVals(szFile, pKeys, KeyVals, Match);
+  if (Match == -1) {
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to open file [%s] with errno [%d]\n", szFile,
-             errno);
-    return -1;
+             Errno);
   }
-  int Match = 0;
-  ReadKeyVals(pFile.get(), pKeys, KeyVals, Match);
   return Match;
 }
 
@@ -223,8 +228,7 @@ int UpdateKeyVals(const char* szFile, const KEY_VAL_MAP& AddKeyVals, const KEY_S
   }
   KEY_VAL_MAP KeyVals;
   int Match = 0;
-  const File pFile(fopen(szFile, "re"));
-  const int Errno = pFile == nullptr ? errno : ReadKeyVals(pFile.get(), nullptr, KeyVals, Match);
+  const int Errno = ReadKeyVals(szFile, nullptr, KeyVals, Match);
   if (Errno != 0) {
     // After a failed read too: what was read so far must not become the whole file.
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to open file [%s] with errno [%d]\n", szFile,
