@@ -10,6 +10,7 @@
 #include <cerrno>
 #include <cstdarg>
 #include <cstdio>
+#include <cstring>
 #include <ctime>
 #include <map>
 #include <set>
@@ -47,6 +48,7 @@ namespace {
 
 constexpr int LOG_LOCK_TIMEOUT_SEC = 120;
 constexpr int FIELD_SIZE = 128;
+constexpr size_t LINE_SIZE = 1024;
 
 const char* KiGetLogFilePath(LOG_TYPE LogType) {
   switch (LogType) {
@@ -66,20 +68,19 @@ bool LogInMs() {
 // Fills the FIELD_SIZE bytes of szTime, or leaves them empty when the clock cannot be converted.
 // The month has its English name in every locale.
 const char* KiGetPresentTime(char* szTime) {
-  static const char* const rgMonth[] = {"Jan", "Feb", "Mar", "Apr", "May", "Jun",
-                                        "Jul", "Aug", "Sep", "Oct", "Nov", "Dec"};
+  static const char* const rgFormat[] = {"Jan %e %T", "Feb %e %T", "Mar %e %T", "Apr %e %T",
+                                         "May %e %T", "Jun %e %T", "Jul %e %T", "Aug %e %T",
+                                         "Sep %e %T", "Oct %e %T", "Nov %e %T", "Dec %e %T"};
   timeval tvNow;
   tm Local;
   gettimeofday(&tvNow, nullptr);
   if (localtime_r(&tvNow.tv_sec, &Local) == nullptr) {
     return szTime;
   }
-  char szTimeMs[32] = "";
+  const size_t Len = strftime(szTime, FIELD_SIZE, rgFormat[Local.tm_mon], &Local);
   if (LogInMs()) {
-    snprintf(szTimeMs, sizeof(szTimeMs), ".%03ld", static_cast<long>(tvNow.tv_usec / 1000));
+    snprintf(szTime + Len, FIELD_SIZE - Len, ".%03ld", static_cast<long>(tvNow.tv_usec / 1000));
   }
-  snprintf(szTime, FIELD_SIZE, "%s %2d %02d:%02d:%02d%s", rgMonth[Local.tm_mon], Local.tm_mday,
-           Local.tm_hour, Local.tm_min, Local.tm_sec, szTimeMs);
   return szTime;
 }
 
@@ -88,62 +89,94 @@ void ReportLostLine(int LineNo, const char* szStep) {
          szStep, errno);
 }
 
-// Opens and locks the log file, or reports why it cannot and returns null.
-FILE* OpenLog(LOG_TYPE LogType) {
+// Opens and locks the log file, or reports why it cannot and returns -1.
+int OpenLog(LOG_TYPE LogType) {
   const char* szPath = KiGetLogFilePath(LogType);
   errno = EINVAL;  // what a type without a path is reported with
   const int Fd =
       szPath == nullptr ? -1 : open(szPath, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0666);
   if (Fd == -1) {
     ReportLostLine(__LINE__, "open");
-    return nullptr;
-  }
-  FILE* pStream = fdopen(Fd, "a");
-  if (pStream == nullptr) {
-    ReportLostLine(__LINE__, "fdopen");
-    close(Fd);
-    return nullptr;
+    return -1;
   }
   if (KiFlock::Lock(Fd, LOG_LOCK_TIMEOUT_SEC, true) != 0) {
     ReportLostLine(__LINE__, "lock");
-    fclose(pStream);
-    return nullptr;
+    close(Fd);
+    return -1;
   }
-  return pStream;
+  return Fd;
 }
 
-// The time is read here, under the lock, so that the lines of a file stand in the order of their
-// times.
-void WritePrefix(FILE* pStream, const char* szCateg, const char* szLevel, const char* szFile,
-                 int LineNo, const char* szFunc) {
+constexpr char PREFIX_FORMAT[] = "%s %s%s %s:%d:%s(): ";
+
+struct PREFIX {
   char szTime[FIELD_SIZE] = "";
-  char szPidTid[FIELD_SIZE] = "";
+  char szPidTid[FIELD_SIZE];
   char szCategLevel[FIELD_SIZE] = "";
+};
+
+// To be called under the lock, so that the lines of a file stand in the order of their times.
+void FillPrefix(PREFIX* pPrefix, const char* szCateg, const char* szLevel) {
   const pid_t Pid = getpid();
   const pid_t Tid = gettid();
+  KiGetPresentTime(pPrefix->szTime);
   if (Pid == Tid) {
-    snprintf(szPidTid, sizeof(szPidTid), "[%d]", Pid);
+    snprintf(pPrefix->szPidTid, FIELD_SIZE, "[%d]", Pid);
   } else {
-    snprintf(szPidTid, sizeof(szPidTid), "[%d][%d]", Pid, Tid);
+    snprintf(pPrefix->szPidTid, FIELD_SIZE, "[%d][%d]", Pid, Tid);
   }
   if (szCateg != nullptr && szLevel != nullptr) {
-    snprintf(szCategLevel, sizeof(szCategLevel), "[%s][%s]", szCateg, szLevel);
+    snprintf(pPrefix->szCategLevel, FIELD_SIZE, "[%s][%s]", szCateg, szLevel);
   }
-  fprintf(pStream, "%s %s%s %s:%d:%s(): ", KiGetPresentTime(szTime), szPidTid, szCategLevel,
-          GetBaseName(szFile).c_str(), LineNo, szFunc);
 }
 
-// To be called with thread cancellation disabled.
+void WriteAll(int Fd, const char* pBuf, size_t Len) {
+  for (ssize_t Written; Len > 0 && (Written = write(Fd, pBuf, Len)) > 0;) {
+    pBuf += Written;
+    Len -= static_cast<size_t>(Written);
+  }
+}
+
+// To be called with thread cancellation disabled. A line of usual length takes no memory and one
+// write; only a longer one is worth a stream.
 __attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const char* szCateg,
                                                      const char* szLevel, const char* szFile,
                                                      int LineNo, const char* szFunc,
                                                      const char* szFormat, va_list Args) {
-  if (FILE* pStream = OpenLog(LogType)) {
-    WritePrefix(pStream, szCateg, szLevel, szFile, LineNo, szFunc);
+  const int Fd = OpenLog(LogType);
+  if (Fd == -1) {
+    return;
+  }
+  for (const char* pEnd; (pEnd = strpbrk(szFile, "/\\")) != nullptr;) {
+    szFile = pEnd + 1;
+  }
+  PREFIX Prefix;
+  FillPrefix(&Prefix, szCateg, szLevel);
+  char szLine[LINE_SIZE];
+  auto Len =
+      static_cast<size_t>(snprintf(szLine, LINE_SIZE, PREFIX_FORMAT, Prefix.szTime, Prefix.szPidTid,
+                                   Prefix.szCategLevel, szFile, LineNo, szFunc));
+  if (Len < LINE_SIZE) {
+    va_list Copy;
+    va_copy(Copy, Args);
+    Len +=
+        static_cast<size_t>(std::max(0, vsnprintf(szLine + Len, LINE_SIZE - Len, szFormat, Copy)));
+    va_end(Copy);
+  }
+  if (Len < LINE_SIZE) {
+    WriteAll(Fd, szLine, Len);
+    KiFlock::UnLock(Fd);
+    close(Fd);
+  } else if (FILE* pStream = fdopen(Fd, "a")) {
+    fprintf(pStream, PREFIX_FORMAT, Prefix.szTime, Prefix.szPidTid, Prefix.szCategLevel, szFile,
+            LineNo, szFunc);
     vfprintf(pStream, szFormat, Args);
     fflush(pStream);
-    KiFlock::UnLock(fileno(pStream));
+    KiFlock::UnLock(Fd);
     fclose(pStream);
+  } else {
+    ReportLostLine(__LINE__, "fdopen");
+    close(Fd);
   }
 }
 
