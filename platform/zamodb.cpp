@@ -26,9 +26,10 @@ struct DBResult_tag {
 namespace {
 
 constexpr int BUSY_TIMEOUT_MSEC = 5000;
-// What one statement may have to take back is kept in memory up to this size, which is several
-// times an appliance's cameras; beyond it SQLite uses a temporary file.
-constexpr int STATEMENT_JOURNAL_BYTES = 1024 * 1024;
+// What one statement may have to take back is kept in memory, whatever its size. A limit would not
+// do: SQLite moves what exceeds it to a temporary file in one piece, fails when that is larger than
+// 128 KiB, and a few dozen cameras are more than that.
+constexpr int STATEMENT_JOURNAL_UNLIMITED = -1;
 
 struct StatementFinalizer {
   void operator()(sqlite3_stmt* pStatement) const { sqlite3_finalize(pStatement); }
@@ -111,7 +112,7 @@ DBConnect* ZAMODBConnect(const char* /*szHost*/, const char* /*szUser*/, const c
     return nullptr;
   }
   static const int Configured =
-      sqlite3_config(SQLITE_CONFIG_STMTJRNL_SPILL, STATEMENT_JOURNAL_BYTES);
+      sqlite3_config(SQLITE_CONFIG_STMTJRNL_SPILL, STATEMENT_JOURNAL_UNLIMITED);
   static_cast<void>(
       Configured);  // too late, and harmless, where the process has used SQLite before
   auto pConn = std::make_unique<DBConnect>();

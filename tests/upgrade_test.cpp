@@ -167,8 +167,11 @@ TEST_F(Upgrade, LargeCapabilityDirectoryThatOthersChange) {
 TEST_F(Upgrade, WritesOnlyItsFilesAndThoseInAnOrderThatLasts) {
   StartOver();
   fs::copy(EXAMPLES + "KICapInfo", CAP_DIR);
-  const string strCameras = "SELECT 'HJT', 'ICZX23' FROM generate_series(1, 2000)";
-  Sql(SYSTEM_DB, "INSERT INTO camera (vendor, model) " + strCameras);
+  // Each of them is changed twice in one transaction, so there is much for a statement to take
+  // back.
+  Sql(SYSTEM_DB,
+      "INSERT INTO camera (vendor, model, resolution, live_resolution) SELECT 'FOSCAM', "
+      "'R4', '2048x1536', '2048x1536' FROM generate_series(1, 9000)");
   const RUN Run = RunTool("0", "ASAN_OPTIONS=detect_leaks=0 strace -fyo /var/trace -e %file,fsync");
   EXPECT_EQ(Run.Status, 0) << Run.strOutput;
   // Without ThreadSanitizer's own.
