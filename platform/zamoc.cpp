@@ -7,11 +7,11 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <climits>
 #include <cstdio>
 #include <cstdlib>
 #include <memory>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "kiflock.h"
@@ -24,11 +24,6 @@ constexpr const char* BLANKS = " \t";
 constexpr const char* TMP_NAME = "/.tesselupgrader.tmp";
 
 // --- Files ---
-
-struct FileCloser {
-  void operator()(FILE* pFile) const { fclose(pFile); }
-};
-using File = std::unique_ptr<FILE, FileCloser>;
 
 class Descriptor {
  public:
@@ -52,39 +47,35 @@ class TmpFile {
  public:
   explicit TmpFile(const std::string& strDir) : m_strName(strDir + TMP_NAME) {
     unlink(m_strName.c_str());
-    const int Fd = open(m_strName.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600);
-    if (Fd == -1) {
-      return;
-    }
-    m_blCreated = true;
-    m_pStream.reset(fdopen(Fd, "w"));
-    if (m_pStream == nullptr) {
-      close(Fd);
-    }
+    m_Fd = open(m_strName.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600);
+    m_blUnnamed = m_Fd != -1;
   }
   ~TmpFile() {
-    if (m_blCreated) {
+    if (m_Fd != -1) {
+      close(m_Fd);
+    }
+    if (m_blUnnamed) {
       unlink(m_strName.c_str());
     }
   }
   TmpFile(const TmpFile&) = delete;
   TmpFile& operator=(const TmpFile&) = delete;
 
-  // Null when it could not be created.
-  FILE* Stream() const { return m_pStream.get(); }
+  // -1 when it could not be created.
+  int Get() const { return m_Fd; }
 
   int RenameTo(const std::string& strName) {
     if (rename(m_strName.c_str(), strName.c_str()) != 0) {
       return -1;
     }
-    m_blCreated = false;
+    m_blUnnamed = false;
     return 0;
   }
 
  private:
   const std::string m_strName;
-  File m_pStream;
-  bool m_blCreated = false;
+  int m_Fd = -1;
+  bool m_blUnnamed = false;  // it is there, and has only its temporary name
 };
 
 // What a killed process left behind is nobody's capability file: the next change in its directory
@@ -109,29 +100,50 @@ int CheckFile(const struct stat& Stat) {
 }
 
 // Opening anything but a regular file could hang (a FIFO) or have effects (a device), so it is
-// looked at first, and again once open. Null with errno when it cannot be a capability file.
-File OpenRegular(const char* szFile) {
-  struct stat Stat;
-  if (stat(szFile, &Stat) != 0 || CheckFile(Stat) != 0) {
-    return nullptr;
+// looked at first, and again once open. Returns a descriptor and what it leads to, or -1 with errno
+// when that cannot be a capability file.
+int OpenRegular(const char* szFile, struct stat* pStat) {
+  if (stat(szFile, pStat) != 0 || CheckFile(*pStat) != 0) {
+    return -1;
   }
   if (IsTmpFile(szFile)) {
     errno = EINVAL;
-    return nullptr;
+    return -1;
   }
   const int Fd = open(szFile, O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
-  if (Fd == -1) {
-    return nullptr;
-  }
-  File pFile(fdopen(Fd, "r"));
-  if (pFile == nullptr) {
+  if (Fd != -1 && (fstat(Fd, pStat) != 0 || CheckFile(*pStat) != 0)) {
+    const int Errno = errno;
     close(Fd);
-    return nullptr;
+    errno = Errno;
+    return -1;
   }
-  if (fstat(Fd, &Stat) != 0 || CheckFile(Stat) != 0) {
-    return nullptr;
+  return Fd;
+}
+
+// Reads all that is left of a file. Returns 0, or -1 with errno, also when it grows too large.
+int ReadAll(int Fd, std::string* pText) {
+  char rgBuf[16384];
+  ssize_t Len;
+  pText->clear();
+  while ((Len = read(Fd, rgBuf, sizeof(rgBuf))) > 0) {
+    pText->append(rgBuf, static_cast<size_t>(Len));
+    if (pText->size() > static_cast<size_t>(MAX_FILE_SIZE)) {
+      errno = EFBIG;
+      return -1;
+    }
   }
-  return pFile;
+  return Len == 0 ? 0 : -1;
+}
+
+int WriteAll(int Fd, std::string_view Text) {
+  while (!Text.empty()) {
+    const ssize_t Len = write(Fd, Text.data(), Text.size());
+    if (Len == -1) {
+      return -1;
+    }
+    Text.remove_prefix(static_cast<size_t>(Len));
+  }
+  return 0;
 }
 
 // Whether it is the name, and no failure, that kept OpenRegular from opening.
@@ -139,61 +151,44 @@ bool HoldsNoKeys(int Errno) {
   return Errno == EINVAL || Errno == EFBIG || Errno == ENOENT || Errno == ELOOP;
 }
 
-// --- Lines ---
+// --- Lines, which keep their line feeds and may hold any bytes ---
 
-// Reads a file line by line; a line keeps its line feed and may hold any bytes.
-class LineReader {
- public:
-  explicit LineReader(FILE* pFile) : m_pFile(pFile) {}
-  ~LineReader() { free(m_pLine); }
-  LineReader(const LineReader&) = delete;
-  LineReader& operator=(const LineReader&) = delete;
+// Takes the first line, with its line feed, off a text that is not empty.
+std::string_view TakeLine(std::string_view* pText) {
+  const size_t Feed = pText->find('\n');
+  const std::string_view Line = pText->substr(0, Feed == std::string_view::npos ? Feed : Feed + 1);
+  pText->remove_prefix(Line.size());
+  return Line;
+}
 
-  // False at the end and on a failure, which Failed() tells apart.
-  bool Next(std::string* pLine) {
-    const ssize_t Len = getline(&m_pLine, &m_Size, m_pFile);
-    if (Len < 0 || ferror(m_pFile) != 0) {
-      return false;
-    }
-    pLine->assign(m_pLine, static_cast<size_t>(Len));
-    return true;
-  }
-  bool Failed() const { return feof(m_pFile) == 0; }
-
- private:
-  FILE* const m_pFile;
-  char* m_pLine = nullptr;
-  size_t m_Size = 0;
-};
-
-std::string TrimBlanks(const std::string& strText) {
-  const size_t First = strText.find_first_not_of(BLANKS);
-  if (First == std::string::npos) {
+std::string_view TrimBlanks(std::string_view Text) {
+  const size_t First = Text.find_first_not_of(BLANKS);
+  if (First == std::string_view::npos) {
     return "";
   }
-  return strText.substr(First, strText.find_last_not_of(BLANKS) - First + 1);
+  return Text.substr(First, Text.find_last_not_of(BLANKS) - First + 1);
 }
 
 // The key of a line, empty when it has none.
-std::string KeyOf(const std::string& strLine) {
-  const size_t Equals = strLine.find('=');
-  if (Equals == std::string::npos || strLine[0] == '#') {
+std::string_view KeyOf(std::string_view Line) {
+  const size_t Equals = Line.find('=');
+  if (Equals == std::string_view::npos || Line[0] == '#') {
     return "";
   }
-  return TrimBlanks(strLine.substr(0, Equals));
+  return TrimBlanks(Line.substr(0, Equals));
 }
 
-std::string ValueOf(std::string strLine) {
+std::string_view ValueOf(std::string_view Line) {
   for (const char LineEnd : {'\n', '\r'}) {
-    if (!strLine.empty() && strLine.back() == LineEnd) {
-      strLine.pop_back();
+    if (!Line.empty() && Line.back() == LineEnd) {
+      Line.remove_suffix(1);
     }
   }
-  std::string strValue = TrimBlanks(strLine.substr(strLine.find('=') + 1));
-  if (strValue.size() >= 2 && strValue.front() == '"' && strValue.back() == '"') {
-    strValue = strValue.substr(1, strValue.size() - 2);
+  std::string_view Value = TrimBlanks(Line.substr(Line.find('=') + 1));
+  if (Value.size() >= 2 && Value.front() == '"' && Value.back() == '"') {
+    Value = Value.substr(1, Value.size() - 2);
   }
-  return strValue;
+  return Value;
 }
 
 // Fills the two "%s" of strFormat. Returns nothing when it has not exactly two, or when they do not
@@ -212,18 +207,16 @@ std::string FormatLine(const std::string& strFormat, const std::string& strKey,
   return blOneLine && KeyOf(strLine) == strKey ? strLine : "";
 }
 
-// Reads up to the first line of strKey. Returns 1 with its value, 0 when there is none, -1 on
-// failure.
-int FindKey(FILE* pFile, const std::string& strKey, std::string* pValue) {
-  LineReader Reader(pFile);
-  std::string strLine;
-  while (Reader.Next(&strLine)) {
-    if (!strKey.empty() && KeyOf(strLine) == strKey) {
-      *pValue = ValueOf(strLine);
-      return 1;
+// Whether there is a line of that key; *pValue is then the value of the first.
+bool FindKey(std::string_view Text, std::string_view Key, std::string_view* pValue) {
+  while (!Text.empty() && !Key.empty()) {
+    const std::string_view Line = TakeLine(&Text);
+    if (KeyOf(Line) == Key) {
+      *pValue = ValueOf(Line);
+      return true;
     }
   }
-  return Reader.Failed() ? -1 : 0;
+  return false;
 }
 
 // --- Changes ---
@@ -241,48 +234,39 @@ int ReportFailure(const char* szFile, const char* szStep) {
   return -1;
 }
 
-// Copies pOld to pNew, making the changes on the way.
-int CopyChanged(FILE* pOld, FILE* pNew, std::vector<CHANGE> Changes) {
-  LineReader Reader(pOld);
-  std::string strLine;
-  bool blLineOpen = false;
-  while (Reader.Next(&strLine)) {
-    const std::string strKey = KeyOf(strLine);
+// The text with the changes made.
+std::string Changed(std::string_view Text, std::vector<CHANGE> Changes) {
+  std::string strNew;
+  strNew.reserve(Text.size());
+  while (!Text.empty()) {
+    std::string_view Line = TakeLine(&Text);
+    const std::string_view Key = KeyOf(Line);
     const auto Change = std::find_if(Changes.begin(), Changes.end(),
-                                     [&](const CHANGE& It) { return It.strKey == strKey; });
+                                     [&](const CHANGE& It) { return It.strKey == Key; });
     if (Change != Changes.end()) {
       // A repeat of a key that was set goes the way of one that is taken out.
-      strLine = Change->blFound ? "" : Change->strNewLine;
+      Line = Change->blFound ? "" : std::string_view(Change->strNewLine);
       Change->blFound = true;
     }
-    if (!strLine.empty()) {
-      fwrite(strLine.data(), 1, strLine.size(), pNew);
-      blLineOpen = strLine.back() != '\n';
-    }
-  }
-  if (Reader.Failed()) {
-    return -1;
+    strNew += Line;
   }
   for (const CHANGE& Change : Changes) {
     if (Change.blFound || Change.strNewLine.empty()) {
       continue;
     }
-    if (blLineOpen) {
-      fputc('\n', pNew);
-      blLineOpen = false;
+    if (!strNew.empty() && strNew.back() != '\n') {
+      strNew += '\n';
     }
-    fwrite(Change.strNewLine.data(), 1, Change.strNewLine.size(), pNew);
+    strNew += Change.strNewLine;
   }
-  return fflush(pNew) == 0 && ferror(pNew) == 0 ? 0 : -1;
+  return strNew;
 }
 
-// Gives the file behind pNew the owner, group and mode of the one behind pOld.
-int CopyOwnerAndMode(FILE* pOld, FILE* pNew) {
-  struct stat Stat;
-  if (fstat(fileno(pOld), &Stat) != 0 || fchown(fileno(pNew), Stat.st_uid, Stat.st_gid) != 0) {
+int SetOwnerAndMode(int Fd, const struct stat& Stat) {
+  if (fchown(Fd, Stat.st_uid, Stat.st_gid) != 0) {
     return -1;
   }
-  return fchmod(fileno(pNew), Stat.st_mode & 07777);
+  return fchmod(Fd, Stat.st_mode & 07777);
 }
 
 // Replaces the file strReal in the directory behind DirFd by its changed copy. The order makes it
@@ -290,21 +274,23 @@ int CopyOwnerAndMode(FILE* pOld, FILE* pNew) {
 int ReplaceFile(const std::string& strReal, const std::string& strDir, int DirFd,
                 const std::vector<CHANGE>& Changes) {
   const char* szFile = strReal.c_str();
-  const File pOld = OpenRegular(szFile);
-  if (pOld == nullptr) {
+  struct stat Stat;
+  const Descriptor Old(OpenRegular(szFile, &Stat));
+  if (Old.Get() == -1) {
     return ReportFailure(szFile, "open");
   }
   TmpFile New(strDir);
-  if (New.Stream() == nullptr) {
+  if (New.Get() == -1) {
     return ReportFailure(szFile, "creation of a temporary file");
   }
-  if (CopyChanged(pOld.get(), New.Stream(), Changes) != 0) {
+  std::string strText;
+  if (ReadAll(Old.Get(), &strText) != 0 || WriteAll(New.Get(), Changed(strText, Changes)) != 0) {
     return ReportFailure(szFile, "copy");
   }
-  if (CopyOwnerAndMode(pOld.get(), New.Stream()) != 0) {
+  if (SetOwnerAndMode(New.Get(), Stat) != 0) {
     return ReportFailure(szFile, "copy of owner and mode");
   }
-  if (fsync(fileno(New.Stream())) != 0) {
+  if (fsync(New.Get()) != 0) {
     return ReportFailure(szFile, "fsync");
   }
   if (New.RenameTo(strReal) != 0) {
@@ -343,18 +329,21 @@ int ZAMOCFileGetKeyValue(const char* szFile, const char* szKey, char* szValue, s
     return -1;
   }
   szValue[0] = '\0';
-  const File pFile = OpenRegular(szFile);
-  if (pFile == nullptr) {
+  struct stat Stat;
+  const Descriptor File(OpenRegular(szFile, &Stat));
+  if (File.Get() == -1) {
     return HoldsNoKeys(errno) ? -1 : ReportFailure(szFile, "open");
   }
-  std::string strValue;
-  const int Found = FindKey(pFile.get(), szKey, &strValue);
-  if (Found <= 0) {
-    return Found == 0 ? 0 : ReportFailure(szFile, "read");
+  std::string strText;
+  if (ReadAll(File.Get(), &strText) != 0) {
+    return ReportFailure(szFile, "read");
   }
-  strValue.copy(szValue, Size - 1);
-  szValue[std::min(strValue.size(), Size - 1)] = '\0';
-  return static_cast<int>(std::min<size_t>(strValue.size(), INT_MAX));
+  std::string_view Value;
+  if (!FindKey(strText, szKey, &Value)) {
+    return 0;
+  }
+  szValue[Value.copy(szValue, Size - 1)] = '\0';
+  return static_cast<int>(Value.size());
 }
 
 int ZAMOCFileChangeKeys(const char* szFile, const ZAMOCKeyChange* pChanges, size_t Count) {
@@ -387,11 +376,15 @@ int ZAMOCFileRemoveKey(const char* szFile, const char* szKey) {
   if (szFile == nullptr || szKey == nullptr) {
     return -1;
   }
-  std::string strValue;
-  const File pFile = OpenRegular(szFile);
-  const int Found = pFile == nullptr ? -1 : FindKey(pFile.get(), szKey, &strValue);
-  if (Found <= 0) {
-    return Found == 0 ? 0 : ReportFailure(szFile, "read");
+  struct stat Stat;
+  const Descriptor File(OpenRegular(szFile, &Stat));
+  std::string strText;
+  if (File.Get() == -1 || ReadAll(File.Get(), &strText) != 0) {
+    return ReportFailure(szFile, "read");
+  }
+  std::string_view Value;
+  if (!FindKey(strText, szKey, &Value)) {
+    return 0;
   }
   const ZAMOCKeyChange Change = {szKey, nullptr, nullptr};
   return ZAMOCFileChangeKeys(szFile, &Change, 1) == 0 ? 1 : -1;
