@@ -7,8 +7,10 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
+#include <ctime>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -29,9 +31,11 @@ class Descriptor {
  public:
   explicit Descriptor(int Fd) : m_Fd(Fd) {}
   ~Descriptor() {
+    const int Errno = errno;  // what made the caller give up
     if (m_Fd != -1) {
       close(m_Fd);
     }
+    errno = Errno;
   }
   Descriptor(const Descriptor&) = delete;
   Descriptor& operator=(const Descriptor&) = delete;
@@ -99,27 +103,6 @@ int CheckFile(const struct stat& Stat) {
   return 0;
 }
 
-// Opening anything but a regular file could hang (a FIFO) or have effects (a device), so it is
-// looked at first, and again once open. Returns a descriptor and what it leads to, or -1 with errno
-// when that cannot be a capability file.
-int OpenRegular(const char* szFile, struct stat* pStat) {
-  if (stat(szFile, pStat) != 0 || CheckFile(*pStat) != 0) {
-    return -1;
-  }
-  if (IsTmpFile(szFile)) {
-    errno = EINVAL;
-    return -1;
-  }
-  const int Fd = open(szFile, O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
-  if (Fd != -1 && (fstat(Fd, pStat) != 0 || CheckFile(*pStat) != 0)) {
-    const int Errno = errno;
-    close(Fd);
-    errno = Errno;
-    return -1;
-  }
-  return Fd;
-}
-
 // Reads all that is left of a file. Returns 0, or -1 with errno, also when it grows too large.
 int ReadAll(int Fd, std::string* pText) {
   char rgBuf[16384];
@@ -135,6 +118,66 @@ int ReadAll(int Fd, std::string* pText) {
   return Len == 0 ? 0 : -1;
 }
 
+// The file that the thread read last: mostly one key after the other is asked for. It is empty when
+// a further change of the file might not show in its status.
+struct LAST_FILE {
+  struct stat Stat;
+  std::string strText;
+};
+thread_local LAST_FILE gLastFile;
+
+bool IsEqual(const timespec& A, const timespec& B) {
+  return A.tv_sec == B.tv_sec && A.tv_nsec == B.tv_nsec;
+}
+
+bool IsUnchanged(const struct stat& Then, const struct stat& Now) {
+  return Then.st_ino == Now.st_ino && Then.st_dev == Now.st_dev && Then.st_size == Now.st_size &&
+         IsEqual(Then.st_mtim, Now.st_mtim) && IsEqual(Then.st_ctim, Now.st_ctim);
+}
+
+// Whether a change from now on would get another time: the clock for files ticks every 10 ms, or
+// every two seconds where a file system counts whole seconds.
+bool IsSettled(const struct stat& Stat) {
+  timespec Now;
+  clock_gettime(CLOCK_REALTIME, &Now);
+  const int64_t AgeMsec = (int64_t{Now.tv_sec} - Stat.st_ctim.tv_sec) * 1000 +
+                          (Now.tv_nsec - Stat.st_ctim.tv_nsec) / 1000000;
+  return AgeMsec > (Stat.st_ctim.tv_nsec == 0 ? 2000 : 20);
+}
+
+// Returns the text of a capability file, valid until the thread's next call, and the file's status
+// in *pStat; or null with errno and in *pszStep what failed.
+//
+// Opening anything but a regular file could hang (a FIFO) or have effects (a device), so it is
+// looked at first, and again once open.
+const std::string* ReadFile(const char* szFile, struct stat* pStat, const char** pszStep) {
+  *pszStep = "open";
+  if (stat(szFile, pStat) != 0 || CheckFile(*pStat) != 0) {
+    return nullptr;
+  }
+  if (IsTmpFile(szFile)) {
+    errno = EINVAL;
+    return nullptr;
+  }
+  if (IsUnchanged(gLastFile.Stat, *pStat)) {
+    return &gLastFile.strText;
+  }
+  gLastFile.Stat = {};
+  const Descriptor File(open(szFile, O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+  if (File.Get() == -1 || fstat(File.Get(), pStat) != 0 || CheckFile(*pStat) != 0) {
+    return nullptr;
+  }
+  const bool blSettled = IsSettled(*pStat);
+  *pszStep = "read";
+  if (ReadAll(File.Get(), &gLastFile.strText) != 0) {
+    return nullptr;
+  }
+  if (blSettled && gLastFile.strText.size() == static_cast<size_t>(pStat->st_size)) {
+    gLastFile.Stat = *pStat;
+  }
+  return &gLastFile.strText;
+}
+
 int WriteAll(int Fd, std::string_view Text) {
   while (!Text.empty()) {
     const ssize_t Len = write(Fd, Text.data(), Text.size());
@@ -146,7 +189,7 @@ int WriteAll(int Fd, std::string_view Text) {
   return 0;
 }
 
-// Whether it is the name, and no failure, that kept OpenRegular from opening.
+// Whether it is the name, and no failure, that kept ReadFile from opening.
 bool HoldsNoKeys(int Errno) {
   return Errno == EINVAL || Errno == EFBIG || Errno == ENOENT || Errno == ELOOP;
 }
@@ -274,17 +317,17 @@ int SetOwnerAndMode(int Fd, const struct stat& Stat) {
 int ReplaceFile(const std::string& strReal, const std::string& strDir, int DirFd,
                 const std::vector<CHANGE>& Changes) {
   const char* szFile = strReal.c_str();
+  const char* szStep;
   struct stat Stat;
-  const Descriptor Old(OpenRegular(szFile, &Stat));
-  if (Old.Get() == -1) {
-    return ReportFailure(szFile, "open");
+  const std::string* pText = ReadFile(szFile, &Stat, &szStep);
+  if (pText == nullptr) {
+    return ReportFailure(szFile, szStep);
   }
   TmpFile New(strDir);
   if (New.Get() == -1) {
     return ReportFailure(szFile, "creation of a temporary file");
   }
-  std::string strText;
-  if (ReadAll(Old.Get(), &strText) != 0 || WriteAll(New.Get(), Changed(strText, Changes)) != 0) {
+  if (WriteAll(New.Get(), Changed(*pText, Changes)) != 0) {
     return ReportFailure(szFile, "copy");
   }
   if (SetOwnerAndMode(New.Get(), Stat) != 0) {
@@ -329,17 +372,14 @@ int ZAMOCFileGetKeyValue(const char* szFile, const char* szKey, char* szValue, s
     return -1;
   }
   szValue[0] = '\0';
+  const char* szStep;
   struct stat Stat;
-  const Descriptor File(OpenRegular(szFile, &Stat));
-  if (File.Get() == -1) {
-    return HoldsNoKeys(errno) ? -1 : ReportFailure(szFile, "open");
-  }
-  std::string strText;
-  if (ReadAll(File.Get(), &strText) != 0) {
-    return ReportFailure(szFile, "read");
+  const std::string* pText = ReadFile(szFile, &Stat, &szStep);
+  if (pText == nullptr) {
+    return HoldsNoKeys(errno) ? -1 : ReportFailure(szFile, szStep);
   }
   std::string_view Value;
-  if (!FindKey(strText, szKey, &Value)) {
+  if (!FindKey(*pText, szKey, &Value)) {
     return 0;
   }
   szValue[Value.copy(szValue, Size - 1)] = '\0';
@@ -376,14 +416,14 @@ int ZAMOCFileRemoveKey(const char* szFile, const char* szKey) {
   if (szFile == nullptr || szKey == nullptr) {
     return -1;
   }
+  const char* szStep;
   struct stat Stat;
-  const Descriptor File(OpenRegular(szFile, &Stat));
-  std::string strText;
-  if (File.Get() == -1 || ReadAll(File.Get(), &strText) != 0) {
-    return ReportFailure(szFile, "read");
+  const std::string* pText = ReadFile(szFile, &Stat, &szStep);
+  if (pText == nullptr) {
+    return ReportFailure(szFile, szStep);
   }
   std::string_view Value;
-  if (!FindKey(strText, szKey, &Value)) {
+  if (!FindKey(*pText, szKey, &Value)) {
     return 0;
   }
   const ZAMOCKeyChange Change = {szKey, nullptr, nullptr};

@@ -108,6 +108,15 @@ TEST_F(CapabilityFile, OneKeyIsReadSetAndRemovedAndNoOtherByteChanges) {
   }
 }
 
+// Also one of the same size at the same time, and one behind a read that was long after the last.
+TEST_F(CapabilityFile, ChangeByOthersIsSeen) {
+  for (int Idx = 1000; Idx < 1300; ++Idx) {
+    WriteFile(m_strFile, "k=" + itos(Idx));
+    usleep(Idx < 1290 ? 0 : 30000);
+    EXPECT_EQ(Get("k") + " " + Get("k"), "4 " + itos(Idx) + " 4 " + itos(Idx));
+  }
+}
+
 TEST_F(CapabilityFile, FailedReadIsAnErrorAndReported) {
   SyslogSocket Syslog;
   m_strFile = "/proc/self/mem";
