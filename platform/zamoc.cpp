@@ -50,8 +50,10 @@ class Descriptor {
 class TmpFile {
  public:
   explicit TmpFile(const std::string& strDir) : m_strName(strDir + TMP_NAME) {
-    unlink(m_strName.c_str());
-    m_Fd = open(m_strName.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600);
+    m_Fd = Create();
+    if (m_Fd == -1 && errno == EEXIST && unlink(m_strName.c_str()) == 0) {
+      m_Fd = Create();
+    }
     m_blUnnamed = m_Fd != -1;
   }
   ~TmpFile() {
@@ -77,6 +79,10 @@ class TmpFile {
   }
 
  private:
+  int Create() const {
+    return open(m_strName.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600);
+  }
+
   const std::string m_strName;
   int m_Fd = -1;
   bool m_blUnnamed = false;  // it is there, and has only its temporary name
@@ -103,7 +109,7 @@ int CheckFile(const struct stat& Stat) {
   return 0;
 }
 
-// Reads all that is left of a file. Returns 0, or -1 with errno, also when it grows too large.
+// Reads a file to its end. Returns 0, or -1 with errno, also when it grows too large.
 int ReadAll(int Fd, std::string* pText) {
   char rgBuf[16384];
   ssize_t Len;
@@ -250,14 +256,18 @@ std::string FormatLine(const std::string& strFormat, const std::string& strKey,
   return blOneLine && KeyOf(strLine) == strKey ? strLine : "";
 }
 
-// Whether there is a line of that key; *pValue is then the value of the first.
+// Whether there is a line of that key; *pValue is then the value of the first. Only lines that the
+// key stands in are looked at.
 bool FindKey(std::string_view Text, std::string_view Key, std::string_view* pValue) {
-  while (!Text.empty() && !Key.empty()) {
+  size_t Pos = Key.empty() ? std::string_view::npos : Text.find(Key);
+  while (Pos != std::string_view::npos) {
+    Text.remove_prefix(Text.rfind('\n', Pos) + 1);
     const std::string_view Line = TakeLine(&Text);
     if (KeyOf(Line) == Key) {
       *pValue = ValueOf(Line);
       return true;
     }
+    Pos = Text.find(Key);
   }
   return false;
 }
@@ -345,13 +355,21 @@ int ReplaceFile(const std::string& strReal, const std::string& strDir, int DirFd
   return 0;
 }
 
+bool IsLink(const char* szFile) {
+  struct stat Stat;
+  return lstat(szFile, &Stat) == 0 && S_ISLNK(Stat.st_mode);
+}
+
 int ChangeFile(const char* szFile, const std::vector<CHANGE>& Changes) {
-  // A link stays: the file it leads to is the one that is replaced.
-  const std::unique_ptr<char, decltype(&free)> pReal(realpath(szFile, nullptr), free);
-  if (pReal == nullptr) {
-    return ReportFailure(szFile, "realpath");
+  std::string strReal = szFile;
+  if (strReal.find('/') == std::string::npos || IsLink(szFile)) {
+    // A link stays: the file it leads to is the one that is replaced.
+    const std::unique_ptr<char, decltype(&free)> pReal(realpath(szFile, nullptr), free);
+    if (pReal == nullptr) {
+      return ReportFailure(szFile, "realpath");
+    }
+    strReal = pReal.get();
   }
-  const std::string strReal = pReal.get();
   const std::string strDir = strReal.substr(0, std::max<size_t>(strReal.rfind('/'), 1));
   const Descriptor Dir(open(strDir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (Dir.Get() == -1) {
