@@ -26,10 +26,9 @@ struct DBResult_tag {
 namespace {
 
 constexpr int BUSY_TIMEOUT_MSEC = 5000;
-// What one statement may have to take back is kept in memory, whatever its size. A limit would not
-// do: SQLite moves what exceeds it to a temporary file in one piece, fails when that is larger than
-// 128 KiB, and a few dozen cameras are more than that.
-constexpr int STATEMENT_JOURNAL_UNLIMITED = -1;
+// What one statement may have to take back is kept in memory up to this size. It is the most that
+// SQLite can move to a temporary file then: it does so in one write, of at most 128 KiB.
+constexpr int STATEMENT_JOURNAL_BYTES = 31 * 4096;
 // The pages that connections have read are kept in one place that lasts, which the processor's
 // cache holds. The pages a transaction changes go beyond it, to the heap, and stay there until they
 // are as many as SQLite lets a cache have; writing them early would cost another sync each time. A
@@ -57,7 +56,7 @@ void ReportFailure(sqlite3* pDb, const char* szDBName, const char* szReason) {
 // before.
 bool ConfigureSqlite() {
   alignas(8) static char PageSlots[PAGE_SLOTS * PAGE_SLOT_BYTES];
-  return sqlite3_config(SQLITE_CONFIG_STMTJRNL_SPILL, STATEMENT_JOURNAL_UNLIMITED) == SQLITE_OK &&
+  return sqlite3_config(SQLITE_CONFIG_STMTJRNL_SPILL, STATEMENT_JOURNAL_BYTES) == SQLITE_OK &&
          sqlite3_config(SQLITE_CONFIG_PAGECACHE, PageSlots, PAGE_SLOT_BYTES, PAGE_SLOTS) ==
              SQLITE_OK &&
          // Nobody asks for statistics, which cost a lock at every allocation.
