@@ -47,9 +47,9 @@ char* HttpBase64Encode(const char* src);
 // The 32 lower-case hexadecimal digits of a 16-byte hash.
 std::string UnsignedHashToStr(const unsigned char* pHashBuf);
 
-// The numbers in strValue, parted by any of the bytes in strDelim, empty pieces left out. Each
-// piece is read as far as it is a decimal number, else it is 0; one beyond the 32-bit range gives
-// the range's nearest end.
+// The numbers in strValue, up to its first NUL, parted by any of the bytes in strDelim, empty
+// pieces left out. Each piece is read as far as it is a decimal number, else it is 0; one beyond
+// the 32-bit range gives the range's nearest end.
 std::vector<int32_t> String2IntVector(const std::string& strValue, const std::string& strDelim);
 
 // A point in time is a timeval, a count of microseconds since 1970-01-01 00:00:00 UTC

@@ -263,11 +263,17 @@ void Utils(const string& strSet, const string& strNew, const string& strText) {
   Check(String2IntVector(strText, strChars) == Numbers);
 }
 
-// No text reaches beyond its database or runs for ever, on any connection.
+// No text reaches beyond its database, runs for ever or depends on the time or on chance.
 static int Guard(sqlite3* pDb, char** /*pszError*/, const sqlite3_api_routines* /*pApi*/) {
-  const auto Deny = [](void*, int Action, const char*, const char*, const char*, const char*) {
-    return Action == SQLITE_ATTACH || Action == SQLITE_PRAGMA || Action == SQLITE_CREATE_VTABLE ? 1
-                                                                                                : 0;
+  const auto Deny = [](void*, int Action, const char*, const char* szFunction, const char*,
+                       const char*) {
+    const bool blVaries =
+        Action == SQLITE_FUNCTION &&
+        std::regex_search(szFunction, std::regex("random|date|time|day|epoch", std::regex::icase));
+    return blVaries || Action == SQLITE_ATTACH || Action == SQLITE_PRAGMA ||
+                   Action == SQLITE_CREATE_VTABLE
+               ? 1
+               : 0;
   };
   sqlite3_limit(pDb, SQLITE_LIMIT_LENGTH, 100000);
   sqlite3_progress_handler(
