@@ -8,12 +8,13 @@
 #include <cstdlib>
 
 static const char* const gszFailing = getenv("FAILING_ALLOCATION");
+static const long gFailing = gszFailing == nullptr ? 0 : strtol(gszFailing, nullptr, 10);
 static std::atomic<long> gCount;
 
 extern "C" void* __libc_realloc(void* pOld, size_t Size);
 
 extern "C" void* realloc(void* pOld, size_t Size) {
-  const bool blFails = ++gCount == (gszFailing == nullptr ? 0 : atol(gszFailing));
+  const bool blFails = ++gCount == gFailing;
   errno = blFails ? ENOMEM : errno;
   return blFails ? nullptr : __libc_realloc(pOld, Size);
 }

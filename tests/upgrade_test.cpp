@@ -72,20 +72,24 @@ TEST_F(Upgrade, FailedTextIsUndoneWholeAndEndsItsAction) {
 // says what a run must make of it, one text of an action after the other until one fails; the names
 // of actions that fail at once may be given.
 TEST_F(Upgrade, HostileDatabases) {
+  const string strMake = "rm -f /var/held; D=" + SYSTEM_DB + "; eval \"$ROW\"; cp $D ";
+  const string strTransact = "sqlite3 -bail " + EXPECTED_DB + " \"BEGIN;$TEXT;COMMIT;\"";
+  const string strCompare = "sqlite3 " + EXPECTED_DB +
+                            " .dump >/var/dump; sqlite3 file:" + SYSTEM_DB +
+                            "?nolock=1 .dump | diff - /var/dump";
   for (const Lines& Row : ReadTable("databases.tsv")) {
     StartOver();
-    RunCommand("D=" + SYSTEM_DB + "; rm -f /var/held; " + Row[2] + "; cp $D " + EXPECTED_DB);
+    setenv("ROW", Row[2].c_str(), 1);
+    RunCommand(strMake + EXPECTED_DB);
     for (const Lines& Action : m_Actions) {
       int Status = std::regex_match(Action[1], std::regex(Row[3])) ? 1 : 0;
       for (size_t Text = 2; Status == 0 && Text < Action.size(); ++Text) {
-        const string strTransaction = "BEGIN;" + Action[Text] + ";COMMIT;";
-        Status = RunCommand("sqlite3 -bail " + EXPECTED_DB + " \"" + strTransaction + "\"").Status;
+        setenv("TEXT", Action[Text].c_str(), 1);
+        Status = RunCommand(strTransact).Status;
       }
     }
     EXPECT_EQ(RunTool(Row[0]).Status, std::stoi(Row[1])) << Row[2];
-    EXPECT_EQ(RunCommand("sqlite3 file:" + SYSTEM_DB + "?nolock=1 .dump").strOutput,
-              RunCommand("sqlite3 " + EXPECTED_DB + " .dump").strOutput)
-        << Row[2];
+    EXPECT_EQ(RunCommand(strCompare).strOutput, "") << Row[2];
     EXPECT_EQ(RunCommand("grep -q 'error.$' " + LOG_FILE).Status, Row[1] == "0" ? 1 : 0) << Row[2];
   }
 }
@@ -94,20 +98,28 @@ TEST_F(Upgrade, CorruptPageIsAnErrorOrDoesNotMatter) {
   StartOver();
   RunTool("0");
   const string strDump = "sqlite3 " + SYSTEM_DB + " '.dump cam%'";
+  const string strCorrupt =
+      "if [ $PAGE -lt 0 ]; then cat /dev/urandom; else tr '\\0' '\\377' "
+      "</dev/zero; fi | dd bs=4096 count=1 iflag=fullblock conv=notrunc "
+      "seek=${PAGE#-} of=" +
+      SYSTEM_DB;
   WriteFile("/var/upgraded.sql", RunCommand(strDump).strOutput);
   const auto Pages = static_cast<int>(fs::file_size("/var/start.db") / 4096);
-  for (int Page = 0; Page < 2 * Pages; ++Page) {
-    const string strFill = Page < Pages ? "tr '\\0' '\\377' </dev/zero" : "cat /dev/urandom";
+  int Failed = 0;
+  for (int Page = 1 - Pages; Page < Pages; ++Page) {
     StartOver();
-    RunCommand(strFill + " | dd of=" + SYSTEM_DB +
-               " bs=4096 count=1 iflag=fullblock conv=notrunc " + "seek=" + itos(Page % Pages));
+    setenv("PAGE", itos(Page).c_str(), 1);
+    RunCommand(strCorrupt);
     const int Status = RunTool("0").Status;
-    const string strCheck =
-        Status == 0 ? strDump + " | diff - /var/upgraded.sql" : "grep -q 'error.$' " + LOG_FILE;
     EXPECT_TRUE(Status == 0 || Status == 255) << Page;
-    EXPECT_EQ(RunCommand(strCheck).Status, 0) << Page;
+    Failed += Status == 255 ? 1 : 0;
+    EXPECT_EQ(Status == 0 ? RunCommand(strDump + " | diff - /var/upgraded.sql").Status
+                          : RunCommand("grep -q 'error.$' " + LOG_FILE).Status,
+              0)
+        << Page;
     EXPECT_FALSE(fs::exists(SYSTEM_DB + "-journal")) << Page;
   }
+  EXPECT_GT(Failed, Pages);
 }
 
 TEST_F(Upgrade, WithoutDatabaseEachActionFailsOnce) {
