@@ -29,13 +29,11 @@ constexpr int BUSY_TIMEOUT_MSEC = 5000;
 // What one statement may have to take back is kept in memory up to this size. It is the most that
 // SQLite can move to a temporary file then: it does so in one write, of at most 128 KiB.
 constexpr int STATEMENT_JOURNAL_BYTES = 31 * 4096;
-// The pages that connections have read are kept in one place that lasts, which the processor's
-// cache holds. The pages a transaction changes go beyond it, to the heap, and stay there until they
-// are as many as SQLite lets a cache have; writing them early would cost another sync each time. A
-// slot has room for SQLite's default page and what goes with it; larger ones are all on the heap.
-constexpr int PAGE_SLOTS = 32;
-constexpr int PAGE_SLOT_BYTES = 4096 + 512;
-constexpr const char* KEEP_CHANGED_PAGES = "PRAGMA cache_spill = 450";
+
+// In KiB. What was only read takes little room, which the processor's cache holds; what a
+// transaction changes has SQLite's usual room, for writing it early would cost another sync each
+// time.
+constexpr const char* CACHE_SETTINGS = "PRAGMA cache_size = -128; PRAGMA cache_spill = -2000";
 
 struct StatementFinalizer {
   void operator()(sqlite3_stmt* pStatement) const { sqlite3_finalize(pStatement); }
@@ -55,10 +53,7 @@ void ReportFailure(sqlite3* pDb, const char* szDBName, const char* szReason) {
 // Sets what holds for all connections. Fails, and does no harm, where the process has used SQLite
 // before.
 bool ConfigureSqlite() {
-  alignas(8) static char PageSlots[PAGE_SLOTS * PAGE_SLOT_BYTES];
   return sqlite3_config(SQLITE_CONFIG_STMTJRNL_SPILL, STATEMENT_JOURNAL_BYTES) == SQLITE_OK &&
-         sqlite3_config(SQLITE_CONFIG_PAGECACHE, PageSlots, PAGE_SLOT_BYTES, PAGE_SLOTS) ==
-             SQLITE_OK &&
          // Nobody asks for statistics, which cost a lock at every allocation.
          sqlite3_config(SQLITE_CONFIG_MEMSTATUS, 0) == SQLITE_OK;
 }
@@ -139,7 +134,8 @@ DBConnect* ZAMODBConnect(const char* /*szHost*/, const char* /*szUser*/, const c
     ReportFailure(pConn->m_pDb, szDBName, "the file cannot be written");
     return nullptr;
   }
-  sqlite3_exec(pConn->m_pDb, KEEP_CHANGED_PAGES, nullptr, nullptr, nullptr);
+  // Without waiting for a lock, and whatever comes of it: the text runs all the same.
+  sqlite3_exec(pConn->m_pDb, CACHE_SETTINGS, nullptr, nullptr, nullptr);
   sqlite3_busy_timeout(pConn->m_pDb, BUSY_TIMEOUT_MSEC);
   return pConn.release();
 }
