@@ -24,6 +24,7 @@ constexpr int DIR_LOCK_TIMEOUT_SEC = 10;
 constexpr off_t MAX_FILE_SIZE = off_t{16} * 1024 * 1024;
 constexpr const char* BLANKS = " \t";
 constexpr const char* TMP_NAME = "/.tesselupgrader.tmp";
+constexpr const char* OPEN_STEP = "open";
 
 // --- Files ---
 
@@ -141,14 +142,14 @@ bool IsUnchanged(const struct stat& Then, const struct stat& Now) {
          IsEqual(Then.st_mtim, Now.st_mtim) && IsEqual(Then.st_ctim, Now.st_ctim);
 }
 
-// Whether a change from now on would get another time: the clock for files ticks every 10 ms, or
-// every two seconds where a file system counts whole seconds.
+// Whether a change from now on would get another time: the clock that files get theirs from has
+// moved on, by two seconds where a file system counts whole ones.
 bool IsSettled(const struct stat& Stat) {
   timespec Now;
-  clock_gettime(CLOCK_REALTIME, &Now);
-  const int64_t AgeMsec = (int64_t{Now.tv_sec} - Stat.st_ctim.tv_sec) * 1000 +
-                          (Now.tv_nsec - Stat.st_ctim.tv_nsec) / 1000000;
-  return AgeMsec > (Stat.st_ctim.tv_nsec == 0 ? 2000 : 20);
+  clock_gettime(CLOCK_REALTIME_COARSE, &Now);
+  const int64_t AgeNsec = (int64_t{Now.tv_sec} - Stat.st_ctim.tv_sec) * 1000000000 +
+                          (Now.tv_nsec - Stat.st_ctim.tv_nsec);
+  return AgeNsec > (Stat.st_ctim.tv_nsec == 0 ? 2000000000 : 0);
 }
 
 // Returns the text of a capability file, valid until the thread's next call, and the file's status
@@ -157,7 +158,7 @@ bool IsSettled(const struct stat& Stat) {
 // Opening anything but a regular file could hang (a FIFO) or have effects (a device), so it is
 // looked at first, and again once open.
 const std::string* ReadFile(const char* szFile, struct stat* pStat, const char** pszStep) {
-  *pszStep = "open";
+  *pszStep = OPEN_STEP;
   if (stat(szFile, pStat) != 0 || CheckFile(*pStat) != 0) {
     return nullptr;
   }
@@ -196,8 +197,9 @@ int WriteAll(int Fd, std::string_view Text) {
 }
 
 // Whether it is the name, and no failure, that kept ReadFile from opening.
-bool HoldsNoKeys(int Errno) {
-  return Errno == EINVAL || Errno == EFBIG || Errno == ENOENT || Errno == ELOOP;
+bool HoldsNoKeys(const char* szStep, int Errno) {
+  return szStep == OPEN_STEP &&
+         (Errno == EINVAL || Errno == EFBIG || Errno == ENOENT || Errno == ELOOP);
 }
 
 // --- Lines, which keep their line feeds and may hold any bytes ---
@@ -394,7 +396,7 @@ int ZAMOCFileGetKeyValue(const char* szFile, const char* szKey, char* szValue, s
   struct stat Stat;
   const std::string* pText = ReadFile(szFile, &Stat, &szStep);
   if (pText == nullptr) {
-    return HoldsNoKeys(errno) ? -1 : ReportFailure(szFile, szStep);
+    return HoldsNoKeys(szStep, errno) ? -1 : ReportFailure(szFile, szStep);
   }
   std::string_view Value;
   if (!FindKey(*pText, szKey, &Value)) {

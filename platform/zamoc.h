@@ -11,8 +11,9 @@
 // before a call returns success. Until it gets its name it is .tesselupgrader.tmp beside the file;
 // one that a killed process leaves holds no keys, and goes with the next change in its directory.
 // Callers that change files of one directory, in any process, take turns and wait up to ten seconds
-// for theirs. Why a file could not be read or changed goes to syslog at LOG_ERR. Any thread may
-// call any of these.
+// for theirs. Each thread keeps the text of the file that it read last, to be asked for further
+// keys. Why a file could not be read or changed goes to syslog at LOG_ERR. Any thread may call any
+// of these.
 #pragma once
 
 #include <cstddef>

@@ -27,7 +27,8 @@ namespace {
 
 constexpr int BUSY_TIMEOUT_MSEC = 5000;
 // What one statement may have to take back is kept in memory up to this size. It is the most that
-// SQLite can move to a temporary file then: it does so in one write, of at most 128 KiB.
+// SQLite can move to a temporary file then, in one write of at most 128 KiB. Beyond it, which takes
+// some hundred cameras that one text changes twice, there must be a directory for such files.
 constexpr int STATEMENT_JOURNAL_BYTES = 31 * 4096;
 
 // In KiB. What was only read takes little room, which the processor's cache holds; what a

@@ -24,6 +24,7 @@ TEST_F(Log, LineHasEachFieldInItsPlace) {
   KiPrintf(KI_LOG, "utils", nullptr, "dir/", 2, "Fn", "no line feed ");
   KiPrintf(KI_LOG, nullptr, "error", "/x", 3, "Fn", "\n");
   std::thread([&] { KiPrintf(KI_LOG, "c", "l", "f", 4, "Fn", "%s\n", strLong.c_str()); }).join();
+  KiPrintf(KI_LOG, nullptr, nullptr, "f", 6, "Fn", "cut %ls", L"\u00e9");  // not of this locale
   KiPrintf(NOTIFICATION_LOG, nullptr, nullptr, "f", 5, "Fn", "other\n");
   // The start is "@", and "@[]" where a thread id follows.
   const string strPid = itos(getpid()) + "]",
@@ -33,7 +34,7 @@ TEST_F(Log, LineHasEachFieldInItsPlace) {
   EXPECT_EQ(std::regex_replace(strLog, Start, "@$2$3"),
             "@ c.cpp:7:Fn(): v=5 %\n@[utils][error] name:-1:Fn(): 1\n@ :2:Fn(): no line feed "
             "@ x:3:Fn(): \n@[][c][l] f:4:Fn(): " +
-                strLong + "\n@ f:5:Fn(): other\n");
+                strLong + "\n@ f:6:Fn(): cut @ f:5:Fn(): other\n");
 }
 
 TEST_F(Log, LostLinesGoToSyslog) {

@@ -138,7 +138,7 @@ void WriteAll(int Fd, const char* pBuf, size_t Len) {
 }
 
 // To be called with thread cancellation disabled. A line of usual length takes no memory and one
-// write; only a longer one is worth a stream.
+// write; only a longer one, or one that is in part beyond printf, is worth a stream.
 __attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const char* szCateg,
                                                      const char* szLevel, const char* szFile,
                                                      int LineNo, const char* szFunc,
@@ -159,9 +159,10 @@ __attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const cha
   if (Len < LINE_SIZE) {
     va_list Copy;
     va_copy(Copy, Args);
-    Len +=
-        static_cast<size_t>(std::max(0, vsnprintf(szLine + Len, LINE_SIZE - Len, szFormat, Copy)));
+    // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): the analyzer does not know the caller's
+    const int MessageLen = vsnprintf(szLine + Len, LINE_SIZE - Len, szFormat, Copy);
     va_end(Copy);
+    Len = MessageLen < 0 ? LINE_SIZE : Len + static_cast<size_t>(MessageLen);
   }
   if (Len < LINE_SIZE) {
     WriteAll(Fd, szLine, Len);
@@ -170,6 +171,7 @@ __attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const cha
   } else if (FILE* pStream = fdopen(Fd, "a")) {
     fprintf(pStream, PREFIX_FORMAT, Prefix.szTime, Prefix.szPidTid, Prefix.szCategLevel, szFile,
             LineNo, szFunc);
+    // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized)
     vfprintf(pStream, szFormat, Args);
     fflush(pStream);
     KiFlock::UnLock(Fd);
