@@ -172,7 +172,7 @@ TEST_F(Upgrade, LargeCapabilityDirectoryThatOthersChange) {
   RunCommand("cd " + CAP_DIR + "; seq 100000 | xargs touch; echo pan=yes | tee a z >/dev/null; " +
              "while [ -e a ]; do echo pan=yes >b; mv b c; rm c; done &");
   EXPECT_EQ(RunTool("--updateCap " + CAP_DIR).Status, 0);
-  EXPECT_EQ(RunCommand("cd " + CAP_DIR + "; cat a z; rm a; ls | grep -vc [bc]").strOutput,
+  EXPECT_EQ(RunCommand("cd " + CAP_DIR + "; cat a z; rm a; ls | grep -vc '[bc]'").strOutput,
             "pan= step\npan= step\n100001\n");
 }
 
