@@ -1,9 +1,7 @@
 #include "rig.h"
 
-#include <linux/magic.h>
 #include <sys/socket.h>
 #include <sys/un.h>
-#include <sys/vfs.h>
 #include <unistd.h>
 
 #include <cstdio>
@@ -89,26 +87,7 @@ Lines SyslogSocket::Stop() {
 }
 
 void Appliance::SetUp() {
+  ASSERT_FALSE(fs::exists("/var/lib")) << "this is the machine's own /var";
   const string strMkdir = "mkdir -p /var/services/camveld /var/log/camveld " + CAP_DIR;
   ASSERT_EQ(RunCommand("mount -t tmpfs none /var && " + strMkdir).Status, 0);
-}
-
-int main(int argc, char** argv) {
-  std::vector<const char*> Args = {"sh", "-c", "exec \"$0\" " TESSEL_EMULATOR " \"$@\"",
-                                   TESSEL_SOURCE_DIR "/tools/private-var"};
-  Args.insert(Args.end(), argv, argv + argc + 1);  // before its own are taken out
-  ::testing::InitGoogleTest(&argc, argv);
-  struct statfs Var;
-  const bool blMemory = statfs("/var", &Var) == 0 && Var.f_type == TMPFS_MAGIC;
-  if (::testing::GTEST_FLAG(list_tests) || (blMemory && !fs::exists("/var/lib"))) {
-    return RUN_ALL_TESTS();
-  }
-  // This is the machine's own /var.
-  if (getenv("TESSEL_PRIVATE_VAR") != nullptr) {
-    fprintf(stderr, "%s: still sees the host's /var, not started\n", argv[0]);
-    return 1;
-  }
-  execv("/bin/sh", const_cast<char**>(Args.data()));
-  perror("/bin/sh");
-  return 1;
 }
