@@ -143,24 +143,27 @@ TEST_F(Upgrade, CommandLines) {
 }
 
 TEST_F(Upgrade, CapabilityFilesChangeByTheirOwnKeys) {
+  const SyslogSocket Socket;
   // As many bytes as are used of a name: what is behind them is cut off.
   const string strDir = "/var/" + string(250, 'a') + "/" + string(255, 'b');
   const string strCd = "mkdir -p " + strDir + "/dir; cd " + strDir + "; ";
-  RunCommand(
-      strCd +
-      "echo pan=yes | tee a c \"new\nline\" $(printf %0255d) >/var/pan; mkfifo fifo; "
-      "echo ptz_continuous_move=yes | cat - a >b; { head -c 99999 /dev/urandom | tr = x; "
-      "echo; cat b; } >binary; cp c big; truncate -s 100M big; chmod 400 a; ln -s /var/pan link; "
-      "ln -s /dev/zero device; ln -s loop loop; ln -s none dangling");
+  RunCommand(strCd +
+             "echo pan=yes | tee a c secret \"new\nline\" $(printf %0255d) >/var/pan; mkfifo fifo; "
+             "echo ptz_continuous_move=yes | cat - a >b; { head -c 99999 /dev/urandom | tr = x; "
+             "echo; cat b; } >binary; cp c big; truncate -s 100M big; chmod 400 a; chmod 0 secret; "
+             "ln -s /var/pan link; ln -s /dev/zero device; ln -s loop loop; ln -s none dangling; "
+             "ln -s /dev/log socket");
   const string strBinary = "head -n -3 binary | md5sum",
                strBefore = RunCommand(strCd + strBinary).strOutput;
-  EXPECT_EQ(RunTool("--updateCap " + strDir + "x").Status, 0);
+  EXPECT_EQ(RunTool("--updateCap " + strDir + "x", "setpriv --bounding-set -all").Status, 0);
   EXPECT_EQ(RunCommand(strCd + strBinary).strOutput, strBefore);
-  EXPECT_EQ(RunCommand(strCd + "ls -AF; cat a 0* b c link new*; head -n 1 big; ls /var/log/camveld")
+  EXPECT_EQ(RunCommand(strCd +
+                       "ls -AF; cat a 0* b c link new* secret; head -n 1 big; ls /var/log/camveld")
                 .strOutput,
             string(255, '0') + "\na\nb\nbig\nbinary\nc\ndangling@\ndevice@\ndir/\nfifo|\nlink@\n" +
-                "loop@\nnew\nline\npan= step\npan= step\npan= continuous\nptz_speed_max = 1\n" +
-                "pan= step\npan= step\npan= step\npan=yes\n");
+                "loop@\nnew\nline\nsecret\nsocket@\npan= step\npan= step\npan= "
+                "continuous\nptz_speed_max = 1\n" +
+                "pan= step\npan= step\npan= step\npan=yes\npan=yes\n");
 }
 
 TEST_F(Upgrade, LargeCapabilityDirectoryThatOthersChange) {
