@@ -3,10 +3,6 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
-#include <cstdio>
-#include <cstdlib>
-#include <vector>
-
 int main(int argc, char** argv) {
   std::vector<const char*> Args = {"sh", "-c", "exec \"$0\" " TESSEL_EMULATOR " \"$@\"",
                                    TESSEL_SOURCE_DIR "/tools/private-var"};
@@ -15,7 +11,5 @@ int main(int argc, char** argv) {
   if (::testing::GTEST_FLAG(list_tests) || getenv("TESSEL_PRIVATE_VAR") != nullptr) {
     return RUN_ALL_TESTS();
   }
-  execv("/bin/sh", const_cast<char**>(Args.data()));
-  perror("/bin/sh");
-  return 1;
+  return execv("/bin/sh", const_cast<char**>(Args.data()));
 }
