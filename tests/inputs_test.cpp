@@ -111,7 +111,6 @@ void Statements(const string& strFirst, const string& strSecond, const string& s
   DBConnect* pConn = ZAMODBConnect(nullptr, nullptr, nullptr, NAME);
   const int Ret = ZAMODBExecute(pConn, strText.c_str(), &pResult);
   ZAMODBClose(pConn);
-
   sqlite3* pDb = nullptr;
   int Expected = sqlite3_open(EQUAL, &pDb), Rows = -1;
   std::map<std::pair<DBRow, string>, string> Cells;
@@ -189,7 +188,6 @@ void Helpers(const string& strSet, const string& strNew, const string& strText) 
   EXPECT_EQ(GetBaseName(strText), std::regex_replace(strText, std::regex("[^]*[/\\\\]"), ""));
   EXPECT_EQ(UnsignedHashToStr(reinterpret_cast<const unsigned char*>(strHash.data())),
             Hex(strHash.substr(0, 16), "0123456789abcdef"));
-
   for (size_t Pos = 0; Pos < strText.size();) {
     const bool blFound = !strSet.empty() && strText.compare(Pos, strSet.size(), strSet) == 0;
     strReplaced += blFound ? strNew : string(1, strText[Pos]);

@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <thread>
 
 #include "kidebuglog.h"
 #include "kiflock.h"
@@ -36,14 +37,14 @@ TEST_F(Log, LineHasEachFieldInItsPlace) {
   EXPECT_EQ(LogLines(), (Lines{"[c][l] f:Fn(): " + strLong, "[utils][error] c.cpp:Fn(): v=5 %",
                                ":Fn(): ", "f:Fn(): cut "}));
   const string strCut = "cut -c 16- /var/log/camveld/kinotification.log";
-  EXPECT_EQ(RunCommand(strCut).strOutput, " [" + itos(getpid()) + "] f:-1:Fn(): other\n");
+  EXPECT_EQ(RunCommand(strCut), " [" + itos(getpid()) + "] f:-1:Fn(): other\n");
 }
 
 TEST_F(Log, LostLinesGoToSyslog) {
   SyslogSocket Syslog;
   KiPrintf(static_cast<LOG_TYPE>(2), nullptr, nullptr, "f", 1, "Fn", "x\n");
   fs::remove_all("/var/log/camveld");
-  EXPECT_EQ(RunTool("2475").Status, 0);
+  EXPECT_EQ(RunCommand("$T 2475; echo $?"), "0\n");
   const string strOpen =
       "<11> libkimodule/lib/kidebuglog.cpp:KiPrintf(): open kilog file failed with errno ";
   EXPECT_EQ(Syslog.Stop(), (Lines{strOpen + "[22].", strOpen + "[2]."}));
@@ -75,7 +76,7 @@ TEST_F(Log, LinesOf64WritersStayWholeAndInOrder) {
     kill(Pid, blKilled ? SIGKILL : 0);
   }
   while (waitpid(-1, nullptr, WNOHANG) != -1) {
-    EXPECT_EQ(RunCommand("sleep 0.1; logrotate -f -s /var/state /var/conf").strOutput, "");
+    EXPECT_EQ(RunCommand("sleep 0.1; logrotate -f -s /var/state /var/conf"), "");
   }
   EXPECT_EQ(KiFlock(LOG_FILE).LockEx(0), 0);
   const string strCheck = R"(cd /var/log/camveld
@@ -83,14 +84,14 @@ TEST_F(Log, LinesOf64WritersStayWholeAndInOrder) {
     cat $(ls -rv) | sed -E 's/^.{19} \[([0-9]+)]\[[0-9]+] f:([0-3]):Fn\(\): /\1 \2 /' |
       awk '$3 + 0 != next_of[$1, $2]++ || length($4) != $3 % 300 + 1 || NF != 4
         END { for (writer in next_of) complete += next_of[writer] == 1000; print complete }')";
-  EXPECT_EQ(RunCommand(strCheck).strOutput, "48\n");
+  EXPECT_EQ(RunCommand(strCheck), "48\n");
 }
 
 TEST_F(Log, LockWaitsAsLongAsItIsTold) {
   KiFlock Held("/var/file"), Other("/var/file");
   umask(0);
   EXPECT_EQ(Held.LockSh(0) + Other.LockSh(0), 0);  // readers go together
-  EXPECT_EQ(RunCommand("stat -c %a /var/file").strOutput, "644\n");
+  EXPECT_EQ(RunCommand("stat -c %a /var/file"), "644\n");
   EXPECT_EQ(Held.LockEx(0) == -1 ? errno : 0, EWOULDBLOCK);
   Other.UnLock();
   EXPECT_EQ(Held.LockEx(0), 0);  // converts the lock it has
@@ -125,7 +126,7 @@ TEST_F(Log, ConfigurationStaysInsideItsMemoryAndItsSettingsOutlastIt) {
   g_pDbgLogCfg->SetPidLevel(65, LOG_LEVEL_ERROR);
   g_pDbgLogCfg->ClearPid(65);
   g_pDbgLogCfg->ClearPid(1);
-  EXPECT_EQ(Show(), "s" + RunCommand("printf ' %d=5' $(seq 2 63)").strOutput + " 64=1");
+  EXPECT_EQ(Show(), "s" + RunCommand("printf ' %d=5' $(seq 2 63)") + " 64=1");
   pWords[513] = -1;
   pWords[0] = 2;
   g_pDbgLogCfg->SetPidLevel(7, LOG_LEVEL_INFO);
@@ -134,32 +135,28 @@ TEST_F(Log, ConfigurationStaysInsideItsMemoryAndItsSettingsOutlastIt) {
   }
   EXPECT_EQ(Show(), "ms 511:256 512:0 7=4");
   EXPECT_EQ(pWords[642] | pWords[643], 0);
-
   EXPECT_EQ(g_pDbgLogCfg->LoadDbgLogSettings() + g_pDbgLogCfg->SaveDbgLogSettings(), -2);
-  RunProgram(TESSEL_CLIENT, "create");
+  RunCommand("$P create");
   EXPECT_EQ(Show(), "s 0:3 88:0 511:256 512:0");
   fs::create_directories(strDir);
   WriteFile(strFile, "ki_dbglog_settings=x,2,-3,,99\nki_dbglog_time_scale=yes\nzone=x");
-  RunProgram(TESSEL_CLIENT, "create");
+  RunCommand("$P create");
   EXPECT_EQ(Show(), "ms 1:2 2:-3 3:99 4:3 88:0 511:256 512:0");
   EXPECT_EQ(g_pDbgLogCfg->SaveDbgLogSettings(), 0);
-  EXPECT_EQ(RunCommand("sed -E 's/3(,3){83}/3*84/' " + strFile).strOutput,
+  EXPECT_EQ(RunCommand("sed -E 's/3(,3){83}/3*84/' " + strFile),
             "ki_dbglog_settings=\"0,2,-3,99,3*84\"\nki_dbglog_time_scale=\"yes\"\nzone=\"x\"\n");
   WriteFile(strFile, "ki_dbglog_time_scale=Yes");
   EXPECT_EQ(g_pDbgLogCfg->LoadDbgLogSettings() + g_pDbgLogCfg->SaveDbgLogSettings(), 1);
-  EXPECT_EQ(RunCommand("tail -n 1 " + strFile).strOutput, "ki_dbglog_time_scale=\"no\"\n");
+  EXPECT_EQ(RunCommand("tail -n 1 " + strFile), "ki_dbglog_time_scale=\"no\"\n");
 }
 
 TEST_F(Log, ProgramsObeyTheConfigurationThatTheyCanAttach) {
   Create(0);
   g_pDbgLogCfg->SetLogInMs(true);
-  string strAttached =
-      RunProgram(TESSEL_CLIENT, "log 52 7", "setpriv --bounding-set -all").strOutput;
-  strAttached += RunProgram(TESSEL_CLIENT, "log 52 0").strOutput;
-  EXPECT_EQ(strAttached, "00000110");  // before main, in it, after it, at the very end
-  RunTool("2475");
+  EXPECT_EQ(RunCommand("setpriv --bounding-set -all $P log 52 7; $P log 52 0; $T 2475"),
+            "00000110");  // before main, in it, after it, at the very end
   const string strSed = R"(sed -E 's/.{15}(\S*) .\w+.(\[event..)?(\w*).*/\1\3/; s/[0-9]{3}/ms/' )";
-  EXPECT_EQ(RunCommand(strSed + LOG_FILE).strOutput, "debug3\n.msalarm\n.ms\n");
+  EXPECT_EQ(RunCommand(strSed + LOG_FILE), "debug3\n.msalarm\n.ms\n");
 }
 
 TEST_F(Log, GateAsksTheCategoryThenTheProcess) {
@@ -178,8 +175,7 @@ TEST_F(Log, GateAsksTheCategoryThenTheProcess) {
     EXPECT_EQ(Written, Expected);
   }
   const string strSed = "sed -nE '1,8s/.*event]\\[(.*)].* errno 42,.*/\\1/p' " + LOG_FILE;
-  EXPECT_EQ(RunCommand(strSed + " | xargs").strOutput,
-            "alarm error warn notice info debug debug2 debug3\n");
+  EXPECT_EQ(RunCommand(strSed + " | xargs"), "alarm error warn notice info debug debug2 debug3\n");
 }
 
 }  // namespace

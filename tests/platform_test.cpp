@@ -51,7 +51,7 @@ TEST_F(Database, ExecuteReplacesBooleansAndHandsResultsOver) {
   ZAMODBFreeResult(pResult);
   EXPECT_EQ(KiDB::Execute(KiDB::DBI_RECORDING, "SELECT 1", nullptr, false), -1);
   EXPECT_EQ(KiDB::Execute(KiDB::DBI_CNT, "SELECT 1", nullptr, false), -1);
-  EXPECT_EQ(RunCommand("sed 's/.*[0-9]://' " + LOG_FILE).strOutput,
+  EXPECT_EQ(RunCommand("sed 's/.*[0-9]://' " + LOG_FILE),
             "ReplaceBoolForSqlite(): Got sql cmd with bool replaced: SELECT '10011True' n\n"
             "Execute(): Failed to connect to db[1, /var/services/camveld/recording.db].\n"
             "Execute(): Failed to connect to db[2, ].\n");
@@ -85,7 +85,7 @@ TEST_F(CapabilityFile, ReplacementIsWholeAndNotWithoutNeed) {
   RunCommand(strCd +
              "echo k=1 | tee .tesselupgrader.tmp >file; chown 12:34 file; chmod 6741 file; "
              "ln file /var/old; ln -s $PWD/file /var/link; mkfifo fifo");
-  const string strBefore = RunCommand(strCd).strOutput;
+  const string strBefore = RunCommand(strCd);
   EXPECT_EQ(Get(szNone) + Get(CAP_DIR + "/fifo") + Get(CAP_DIR + "/.tesselupgrader.tmp"),
             "-1 -1 -1 ");
   EXPECT_EQ(ZAMOCFileSetKeyValue(szNone, "k", "2", szFormat), -1);
@@ -99,8 +99,7 @@ TEST_F(CapabilityFile, ReplacementIsWholeAndNotWithoutNeed) {
   EXPECT_EQ(ZAMOCFileRemoveKey(szFile, "absent"), 0);
   EXPECT_EQ(fs::hard_link_count("/var/old"), 2u);
   EXPECT_EQ(ZAMOCFileSetKeyValue(szFile, "k", "2", szFormat), 0);
-  EXPECT_EQ(RunCommand(strCd + "cat file /var/old; ls -A").strOutput,
-            strBefore + "k= 2\nk=1\nfifo\nfile\n");
+  EXPECT_EQ(RunCommand(strCd + "cat file /var/old; ls -A"), strBefore + "k= 2\nk=1\nfifo\nfile\n");
 }
 
 }  // namespace

@@ -13,7 +13,6 @@
 #include <regex>
 #include <sstream>
 #include <string>
-#include <thread>
 #include <vector>
 
 namespace fs = std::filesystem;
@@ -52,36 +51,17 @@ inline std::vector<Lines> ReadTable(const string& strName) {
   return Rows;
 }
 
-struct RUN {
-  int Status;        // exit status, as a shell has it
-  string strOutput;  // of both streams
-};
-
-// Runs a shell command, in which $T is the shipped tool, $S the sources, $D the database, $C the
-// capability directory and $L the log.
-inline RUN RunCommand(const string& strCommand) {
-  static const string strFiles = " D=" + SYSTEM_DB + " C=" + CAP_DIR + " L=" + LOG_FILE + "\n";
-  const string strProgram = "\nT='" TESSEL_EMULATOR " " TESSEL_TOOL "' S=" TESSEL_SOURCE_DIR;
+// Runs a shell command in /var and returns what it writes. In it $T is the shipped tool, $P a
+// program of the package, $S the sources, $D the database, $C the capability directory and $L the
+// log.
+inline string RunCommand(const string& strCommand) {
   const string strOutput = "/dev/shm/output-" + std::to_string(gettid());
-  const string strScript = "exec >" + strOutput + " 2>&1" + strProgram + strFiles + strCommand;
-  const int Status = system(strScript.c_str());
-  return {WEXITSTATUS(Status), ReadFile(strOutput)};
-}
-
-// Runs a program of the build, or the shipped tool, through strace or the like when strWrapper is
-// given.
-inline RUN RunProgram(const string& strProgram, const string& strArgs, const string& strWrap = "") {
-  return RunCommand(strWrap + " " TESSEL_EMULATOR " " + strProgram + " " + strArgs);
-}
-inline RUN RunTool(const string& strArgs, const string& strWrapper = "") {
-  return RunProgram(TESSEL_TOOL, strArgs, strWrapper);
-}
-
-// Runs an SQL text with the sqlite3 shell and returns its rows, columns parted by '|'.
-inline string Sql(const string& strDb, const string& strSqlCmd) {
-  const RUN Run = RunCommand("sqlite3 -bail " + strDb + " <<'SQL'\n" + strSqlCmd + "\nSQL");
-  EXPECT_EQ(Run.Status, 0) << Run.strOutput << " in " << strSqlCmd;
-  return Run.strOutput;
+  const string strPrograms = "\nT='" TESSEL_EMULATOR " " TESSEL_TOOL "' P='" TESSEL_EMULATOR
+                             " " TESSEL_CLIENT "' S=" TESSEL_SOURCE_DIR;
+  const string strFiles = " D=" + SYSTEM_DB + " C=" + CAP_DIR + " L=" + LOG_FILE + "\ncd /var\n";
+  const string strScript = "exec >" + strOutput + " 2>&1" + strPrograms + strFiles + strCommand;
+  EXPECT_NE(system(strScript.c_str()), -1);
+  return ReadFile(strOutput);
 }
 
 // The lines of the package log, without time, process and thread id and line number.
@@ -129,7 +109,7 @@ class Appliance : public ::testing::Test {
  protected:
   void SetUp() override {
     ASSERT_FALSE(fs::exists("/var/lib")) << "this is the machine's own /var";
-    const string strMkdir = "mkdir -p /var/services/camveld /var/log/camveld $C";
-    ASSERT_EQ(RunCommand("mount -t tmpfs none /var && " + strMkdir).Status, 0);
+    const string strMkdir = "mkdir -p /var/services/camveld /var/log/camveld $C && echo made";
+    ASSERT_EQ(RunCommand("mount -t tmpfs none /var && " + strMkdir), "made\n");
   }
 };

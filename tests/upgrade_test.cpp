@@ -6,9 +6,6 @@
 
 namespace {
 
-// Runs a shell script in /var, and returns what it writes.
-string Shell(const string& strScript) { return RunCommand("cd /var\n" + strScript).strOutput; }
-
 class Upgrade : public Appliance {
  protected:
   // Makes the example of an appliance, and a line for each transaction of an upgrade: threshold and
@@ -16,7 +13,7 @@ class Upgrade : public Appliance {
   // own; they have the same effect.
   void SetUp() override {
     Appliance::SetUp();
-    Shell(R"sh(
+    RunCommand(R"sh(
       sqlite3 start.db <$S/examples/appliance.sql; cp start.db $D; cp $S/examples/KICapInfo/* $C
       axis=$(sqlite3 start.db "SELECT id FROM camera WHERE vendor='AXIS' AND model='A8105-E'")
       awk -F'\t' -v OFS='|' -v axis="$axis" '{
@@ -30,7 +27,7 @@ class Upgrade : public Appliance {
   // the status, what makes the database, and a pattern of texts that fail in the tool only; an
   // action ends with a text that fails. Returns the status, behind all that is not alike.
   static string Compare(const Lines& Case) {
-    return Shell("V=" + Case[0] + " failing='" + Case[3] + "' status=0\n{ " + Case[2] + R"sh(
+    return RunCommand("V=" + Case[0] + " failing='" + Case[3] + "' status=0\n{ " + Case[2] + R"sh(
       cp $D expected.db; } >out 2>&1
       { echo "tesselupgrader.cpp:main(): TESSEL pre-upgrade version: $V"
         while IFS='|' read -r threshold action text; do
@@ -52,7 +49,7 @@ class Upgrade : public Appliance {
 
 TEST_F(Upgrade, EachThresholdSelectsItsActions) {
   const string strRun = "cut -d'|' -f3- texts | sed 's/;\\|$/;SELECT changes();/g' | sqlite3 $D";
-  EXPECT_EQ(Shell(strRun + " | grep -x 0"), "") << "a text finds no camera in the example";
+  EXPECT_EQ(RunCommand(strRun + " | grep -x 0"), "") << "a text finds no camera in the example";
   for (const Lines& Action : ReadTable("actions.tsv")) {
     for (int Version = std::stoi(Action[0]) - 1; Version <= std::stoi(Action[0]) + 1; ++Version) {
       EXPECT_EQ(Compare({std::to_string(Version), "0", "cp start.db $D", ""}), "0\n") << Version;
@@ -78,10 +75,10 @@ TEST_F(Upgrade, CorruptPageIsAnErrorOrDoesNotMatter) {
 
 // Each command line follows a preparation, and goes on where the one before ended.
 TEST_F(Upgrade, CommandLines) {
-  Shell("rm $C/*");
+  RunCommand("rm $C/*");
   for (const Lines& Row : ReadTable("commandlines.tsv")) {
     const string strRun = "cp start.db $D; rm -f $L\n" + Row[0] + "\n{ $T " + Row[1];
-    EXPECT_EQ(Shell(strRun + R"sh( 2>out; echo $?; cmp -s $D start.db || echo changed
+    EXPECT_EQ(RunCommand(strRun + R"sh( 2>out; echo $?; cmp -s $D start.db || echo changed
         cat $L $C/camera 2>out | sed 's/.*: //'; } | sed 's/r [0-9.]*$/r VERSION/')sh"),
               Row[2])
         << Row[1];
@@ -91,7 +88,7 @@ TEST_F(Upgrade, CommandLines) {
 TEST_F(Upgrade, CapabilityFilesChangeByTheirOwnKeys) {
   const SyslogSocket Socket;
   // As many bytes as are used of a name: what is behind them is cut off.
-  const string strIs = Shell(R"sh(
+  const string strIs = RunCommand(R"sh(
       dir=/var/$(printf %0250d/%0255d); mkdir -p $dir/dir; cd $dir
       echo pan=yes | tee a c secret "new$(printf '\nline')" $(printf %0255d) >/var/pan; cp c big
       echo ptz_continuous_move=yes | cat - a >b; head -c 99999 /dev/urandom | tr = x >/var/head
@@ -109,7 +106,7 @@ TEST_F(Upgrade, CapabilityFilesChangeByTheirOwnKeys) {
 }
 
 TEST_F(Upgrade, LargeCapabilityDirectoryThatOthersChange) {
-  const string strIs = Shell(R"sh(
+  const string strIs = RunCommand(R"sh(
       rm $C/*; cd $C; seq 100000 | xargs touch; echo pan=yes | tee a z >/var/pan
       while [ -e a ]; do echo pan=yes >b; mv b c; rm c; done &
       $T --updateCap $C; echo $?; cat a z; rm a; ls | grep -vc '[bc]')sh");
@@ -118,7 +115,7 @@ TEST_F(Upgrade, LargeCapabilityDirectoryThatOthersChange) {
 
 // Cameras change twice in one transaction: what a statement may have to take back is in memory.
 TEST_F(Upgrade, WritesOnlyItsFiles) {
-  const string strIs = Shell(R"sh(
+  const string strIs = RunCommand(R"sh(
       sqlite3 $D "INSERT INTO camera (vendor, model, resolution, live_resolution)
         SELECT 'FOSCAM', 'R4', '2048x1536', '2048x1536' FROM generate_series(1, 300)"
       ASAN_OPTIONS=detect_leaks=0 strace -fo trace -e %file $T 0; echo $?
@@ -132,7 +129,7 @@ TEST_F(Upgrade, ValgrindFindsNothing) {
   if (sizeof(TESSEL_SANITIZE TESSEL_EMULATOR) > 1) {
     GTEST_SKIP() << "Valgrind runs neither sanitized nor foreign programs";
   }
-  EXPECT_EQ(Shell("valgrind -q --error-exitcode=99 --leak-check=full $T 0; echo $?"), "0\n");
+  EXPECT_EQ(RunCommand("valgrind -q --error-exitcode=99 --leak-check=full $T 0; echo $?"), "0\n");
 }
 
 }  // namespace
