@@ -11,6 +11,7 @@
 #include <memory>
 #include <string_view>
 
+#include "fileops.h"
 #include "kidebuglog.h"
 #include "kiflock.h"
 
@@ -107,52 +108,13 @@ class CancelDisabler {
   CancelDisabler& operator=(const CancelDisabler&) = delete;
 };
 
-// A file beside szTemplate that disappears with the object unless it was given its final name.
-class TmpFile {
- public:
-  explicit TmpFile(const char* szTemplate) : m_strName(CreateTmpFile(szTemplate)) {}
-  ~TmpFile() {
-    if (!m_strName.empty()) {
-      unlink(m_strName.c_str());
-    }
-  }
-  TmpFile(const TmpFile&) = delete;
-  TmpFile& operator=(const TmpFile&) = delete;
-
-  // Empty when it could not be created.
-  const char* Name() const { return m_strName.c_str(); }
-
-  int RenameTo(const char* szFile) {
-    const int Ret = rename(m_strName.c_str(), szFile);
-    if (Ret == 0) {
-      m_strName.clear();
-    }
-    return Ret;
-  }
-
- private:
-  std::string m_strName;
-};
-
-// Returns 0, or the errno of the step that failed.
+// Returns 0, or -1 with the errno of the step that failed.
 int WriteText(const char* szFile, const std::string& strText) {
-  const int Fd = open(szFile, O_WRONLY | O_TRUNC | O_CLOEXEC);
-  if (Fd == -1) {
-    return errno;
+  fileops::Descriptor Fd(open(szFile, O_WRONLY | O_TRUNC | O_CLOEXEC));
+  if (Fd.Get() == -1 || fileops::WriteAll(Fd.Get(), strText.data(), strText.size()) != 0) {
+    return -1;
   }
-  int Errno = 0;
-  for (size_t Done = 0; Done < strText.size() && Errno == 0;) {
-    const ssize_t Len = write(Fd, strText.data() + Done, strText.size() - Done);
-    if (Len >= 0) {
-      Done += static_cast<size_t>(Len);
-    } else if (errno != EINTR) {
-      Errno = errno;
-    }
-  }
-  if (close(Fd) != 0 && Errno == 0) {
-    Errno = errno;
-  }
-  return Errno;
+  return Fd.Close();
 }
 
 int WriteToFile(const char* szFile, const KEY_VAL_MAP& KeyVals, bool blQuoteVal) {
@@ -165,17 +127,16 @@ int WriteToFile(const char* szFile, const KEY_VAL_MAP& KeyVals, bool blQuoteVal)
   for (const auto& [strKey, strVal] : KeyVals) {
     strText.append(strKey).append("=").append(szQuote).append(strVal).append(szQuote).append("\n");
   }
-  const int Errno = WriteText(szFile, strText);
-  if (Errno != 0) {
+  if (WriteText(szFile, strText) != 0) {
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to wrtie file [%s] with errno [%d].\n",
-             szFile, Errno);
+             szFile, errno);
     return -1;
   }
   return 0;
 }
 
 int WriteToFileAtomic(const char* szFile, const KEY_VAL_MAP& KeyVals, bool blQuoteVal) {
-  TmpFile Tmp(szFile);
+  fileops::TmpFile Tmp(CreateTmpFile(szFile));
   if (WriteToFile(Tmp.Name(), KeyVals, blQuoteVal) != 0) {
     return -1;
   }
@@ -285,12 +246,11 @@ int KiFileRemoveKeys(const char* szFile, const std::set<std::string>& Keys) {
 
 std::string CreateTmpFile(const char* szTemplate) {
   std::string strName = std::string(szTemplate) + ".tmp.XXXXXX";
-  const int Fd = mkostemp(strName.data(), O_CLOEXEC);
-  if (Fd == -1) {
+  const fileops::Descriptor Fd(mkostemp(strName.data(), O_CLOEXEC));
+  if (Fd.Get() == -1) {
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to create tmp file with errno [%d]\n",
              errno);
     return "";
   }
-  close(Fd);
   return strName;
 }
