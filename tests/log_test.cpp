@@ -51,6 +51,29 @@ TEST_F(Log, LostLinesGoToSyslog) {
   EXPECT_FALSE(fs::exists("/var/log/camveld"));
 }
 
+TEST_F(Log, ErrnoIsTheCallersInTheMessageAndAfterIt) {
+  const string strLong(2000, 'x');
+  const string strFormat = "%s: %m\n";  // no literal: compilers take %m for an extension
+  const auto WriteLine = [&](LOG_TYPE Type, const string& strText) {
+    errno = ENOENT;
+    KiPrintf(Type, nullptr, nullptr, "f", 1, "Fn", strFormat.c_str(), strText.c_str());
+    EXPECT_EQ(errno, ENOENT) << Type << strText;
+    errno = EACCES;
+    KiDbgPrintf(LOG_CATEG_UTILS, LOG_LEVEL_INFO, "f", 1, "Fn", strFormat.c_str(), strText.c_str());
+    EXPECT_EQ(errno, EACCES) << strText;
+  };
+  WriteLine(KI_LOG, "short");
+  WriteLine(KI_LOG, strLong);
+  const string strUtils = "[utils][info] f:Fn(): ";
+  EXPECT_EQ(LogLines(), (Lines{"f:Fn(): short: No such file or directory",
+                               strUtils + "short: Permission denied",
+                               "f:Fn(): " + strLong + ": No such file or directory",
+                               strUtils + strLong + ": Permission denied"}));
+  WriteLine(static_cast<LOG_TYPE>(2), "a type without a path");
+  fs::remove_all("/var/log/camveld");
+  WriteLine(KI_LOG, "a log that cannot be opened");
+}
+
 // While the log is rotated and some of the writers are killed.
 TEST_F(Log, LinesOf64WritersStayWholeAndInOrder) {
   Create(0666);

@@ -17,6 +17,7 @@
 #include <string>
 #include <vector>
 
+#include "fileops.h"
 #include "fileutils.h"
 #include "kiflock.h"
 #include "utils.h"
@@ -92,9 +93,12 @@ void ReportLostLine(int LineNo, const char* szStep) {
 // Opens and locks the log file, or reports why it cannot and returns -1.
 int OpenLog(LOG_TYPE LogType) {
   const char* szPath = KiGetLogFilePath(LogType);
-  errno = EINVAL;  // what a type without a path is reported with
-  const int Fd =
-      szPath == nullptr ? -1 : open(szPath, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0666);
+  if (szPath == nullptr) {
+    errno = EINVAL;
+    ReportLostLine(__LINE__, "open");
+    return -1;
+  }
+  const int Fd = open(szPath, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0666);
   if (Fd == -1) {
     ReportLostLine(__LINE__, "open");
     return -1;
@@ -137,12 +141,14 @@ void WriteAll(int Fd, const char* pBuf, size_t Len) {
   }
 }
 
+// Writes one line, whose message is formatted with the caller's errno (%m), and keeps that errno.
 // To be called with thread cancellation disabled. A line of usual length takes no memory and one
 // write; only a longer one, or one that is in part beyond printf, is worth a stream.
 __attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const char* szCateg,
                                                      const char* szLevel, const char* szFile,
                                                      int LineNo, const char* szFunc,
                                                      const char* szFormat, va_list Args) {
+  const fileops::ErrnoKeeper Errno;
   const int Fd = OpenLog(LogType);
   if (Fd == -1) {
     return;
@@ -159,6 +165,7 @@ __attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const cha
   if (Len < LINE_SIZE) {
     va_list Copy;
     va_copy(Copy, Args);
+    errno = Errno.Get();
     // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): the analyzer does not know the caller's
     const int MessageLen = vsnprintf(szLine + Len, LINE_SIZE - Len, szFormat, Copy);
     va_end(Copy);
@@ -171,6 +178,7 @@ __attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const cha
   } else if (FILE* pStream = fdopen(Fd, "a")) {
     fprintf(pStream, PREFIX_FORMAT, Prefix.szTime, Prefix.szPidTid, Prefix.szCategLevel, szFile,
             LineNo, szFunc);
+    errno = Errno.Get();
     // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized)
     vfprintf(pStream, szFormat, Args);
     fflush(pStream);

@@ -51,8 +51,9 @@ KiEnum2StrMap<LOG_CATEG>::KiEnum2StrMap();
 // Writes under an exclusive lock on the file, waiting up to 120 seconds for it, so the lines of all
 // threads and processes stay whole and in the order of their times. The file is opened for this
 // call alone and created (mode 0666 less the umask) when missing; its directory is not. A line that
-// cannot be written is lost after one syslog record (LOG_ERR) that says why. Any thread may call
-// it; thread cancellation is disabled meanwhile and always enabled on return.
+// cannot be written is lost after one syslog record (LOG_ERR) that says why. "%m" in szFormat names
+// the caller's errno, which is the same on return. Any thread may call it; thread cancellation is
+// disabled meanwhile and always enabled on return.
 void KiPrintf(LOG_TYPE LogType, const char* szCateg, const char* szLevel, const char* szFile,
               int LineNo, const char* szFunc, const char* szFormat, ...)
     __attribute__((format(printf, 7, 8)));
