@@ -204,13 +204,13 @@ void KiPrintf(LOG_TYPE LogType, const char* szCateg, const char* szLevel, const 
 
 void KiDbgPrintf(LOG_CATEG Categ, LOG_LEVEL Level, const char* szFile, int LineNo,
                  const char* szFunc, const char* szFormat, ...) {
-  int OldState = PTHREAD_CANCEL_ENABLE;
-  pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &OldState);
+  const char* szCateg = Enum2String(Categ);  // the first call may throw: it fills the map
+  const char* szLevel = Enum2String(Level);
+  const fileops::NoCancel Guard;
   va_list Args;
   va_start(Args, szFormat);
-  WriteLine(KI_LOG, Enum2String(Categ), Enum2String(Level), szFile, LineNo, szFunc, szFormat, Args);
+  WriteLine(KI_LOG, szCateg, szLevel, szFile, LineNo, szFunc, szFormat, Args);
   va_end(Args);
-  pthread_setcancelstate(OldState, nullptr);
 }
 
 // --- The shared configuration ---
