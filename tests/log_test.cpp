@@ -5,6 +5,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
 #include <thread>
 
@@ -122,6 +123,39 @@ TEST_F(Log, LockWaitsAsLongAsItIsTold) {
   EXPECT_EQ(Other.LockSh(1) == -1 ? errno : 0, EWOULDBLOCK);
   EXPECT_NEAR(static_cast<double>(GetCurTimestamp() - usecStart), 2e6, 1.1e6);
   EXPECT_EQ(KiFlock("/var/missing/file").LockEx(-1) == -1 ? errno : 0, ENOENT);
+}
+
+// Opens the file, which is a cancellation point, then waits for it, which is none.
+void WaitForLock(std::atomic<int>* pSteps) {
+  KiFlock Lock("/var/file");
+  Lock.LockEx(0);
+  ++*pSteps;
+  Lock.LockEx(-1);
+}
+
+TEST_F(Log, CancelledWaiterReleasesTheLockBeforeItEnds) {
+  static std::atomic<int> Steps;
+  const auto Wait = [](void*) -> void* {
+    WaitForLock(&Steps);
+    ++Steps;
+    pthread_testcancel();
+    ++Steps;
+    return nullptr;
+  };
+  for (int Round = 0; Round < 100; ++Round) {
+    KiFlock Held("/var/file");
+    pthread_t Thread;
+    Steps = 0;
+    ASSERT_EQ(Held.LockEx(0), 0) << "round " << Round;
+    ASSERT_EQ(pthread_create(&Thread, nullptr, Wait, nullptr), 0);
+    while (Steps == 0) {
+      usleep(100);
+    }
+    pthread_cancel(Thread);
+    Held.UnLock();
+    pthread_join(Thread, nullptr);
+    ASSERT_EQ(Steps, 2) << "round " << Round;
+  }
 }
 
 // The switch, each category whose threshold is not that of the one before it, and the processes.

@@ -21,7 +21,10 @@ using KEY_SET = std::set<std::string>;
 using KEY_VAL_MAP = std::map<std::string, std::string>;
 
 struct FileCloser {
-  void operator()(FILE* pFile) const { fclose(pFile); }
+  void operator()(FILE* pFile) const {
+    const fileops::NoCancel Guard;
+    fclose(pFile);
+  }
 };
 using File = std::unique_ptr<FILE, FileCloser>;
 

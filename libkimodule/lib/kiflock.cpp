@@ -9,6 +9,8 @@
 #include <cstdint>
 #include <utility>
 
+#include "fileops.h"
+
 namespace {
 
 constexpr int ATTEMPTS_PER_SEC = 10;
@@ -35,6 +37,7 @@ void KiFlock::UnLock() {
   if (m_Fd < 0) {
     return;
   }
+  const fileops::NoCancel Guard;  // the destructor ends here too
   UnLock(m_Fd);
   close(m_Fd);
   m_Fd = -1;

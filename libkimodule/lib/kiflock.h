@@ -26,7 +26,8 @@ class KiFlock {
   // under their lock, one obtained after waiting may be that of a file already replaced.
   bool IsCurrent() const;
 
-  // Does nothing on an object that holds no descriptor.
+  // Does nothing on an object that holds no descriptor. Neither it nor the destructor is a
+  // cancellation point.
   void UnLock();
 
   // Locks the open descriptor Fd. TimeoutSec below 0 waits for ever, 0 tries once, and a positive
