@@ -10,13 +10,13 @@
 #include <cerrno>
 #include <cstdarg>
 #include <cstdio>
-#include <cstring>
 #include <ctime>
 #include <map>
 #include <set>
 #include <string>
 #include <vector>
 
+#include "basename.h"
 #include "fileops.h"
 #include "fileutils.h"
 #include "kiflock.h"
@@ -153,9 +153,7 @@ __attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const cha
   if (Fd == -1) {
     return;
   }
-  for (const char* pEnd; (pEnd = strpbrk(szFile, "/\\")) != nullptr;) {
-    szFile = pEnd + 1;
-  }
+  szFile += BaseNameOffset(szFile);
   PREFIX Prefix;
   FillPrefix(&Prefix, szCateg, szLevel);
   char szLine[LINE_SIZE];

@@ -12,6 +12,7 @@
 #include <memory>
 #include <string_view>
 
+#include "basename.h"
 #include "delaytimer.h"
 #include "kidebuglog.h"
 #include "strtoint32.h"
@@ -40,8 +41,7 @@ char toHex(unsigned Nibble) { return static_cast<char>(Nibble > 9 ? Nibble + 55 
 }  // namespace
 
 std::string GetBaseName(const std::string& strFullPath) {
-  // npos + 1 is 0: without a separator the whole path is its own base name.
-  return strFullPath.substr(strFullPath.find_last_of("/\\") + 1);
+  return strFullPath.substr(BaseNameOffset(strFullPath));
 }
 
 std::string itos(int64_t i) { return std::to_string(i); }
