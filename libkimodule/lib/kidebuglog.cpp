@@ -134,13 +134,6 @@ void FillPrefix(PREFIX* pPrefix, const char* szCateg, const char* szLevel) {
   }
 }
 
-void WriteAll(int Fd, const char* pBuf, size_t Len) {
-  for (ssize_t Written; Len > 0 && (Written = write(Fd, pBuf, Len)) > 0;) {
-    pBuf += Written;
-    Len -= static_cast<size_t>(Written);
-  }
-}
-
 // Writes one line, whose message is formatted with the caller's errno (%m), and keeps that errno.
 // To be called with thread cancellation disabled. A line of usual length takes no memory and one
 // write; only a longer one, or one that is in part beyond printf, is worth a stream.
@@ -170,7 +163,7 @@ __attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const cha
     Len = MessageLen < 0 ? LINE_SIZE : Len + static_cast<size_t>(MessageLen);
   }
   if (Len < LINE_SIZE) {
-    WriteAll(Fd, szLine, Len);
+    fileops::WriteAll(Fd, szLine, Len);  // a full disk has nobody to tell
     KiFlock::UnLock(Fd);
     close(Fd);
   } else if (FILE* pStream = fdopen(Fd, "a")) {
