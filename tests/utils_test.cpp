@@ -75,7 +75,8 @@ TEST_F(Utils, WriteFdGivesUpOnErrorsAndEmptyWritesOnly) {
   const int64_t usecStart = gClock;
   gWrites = std::istringstream("3 0 0 -4 3 0 0 0 -11 0   1 0 0 0 0 0 99   4");  // EINTR, EAGAIN
   EXPECT_EQ(WriteFd(-1, "0123456789", 10), 6);
-  EXPECT_EQ(WriteFd(-1, "abcdefghij", 10), 10);
+  const unsigned char rgBytes[] = "abcdefghij";
+  EXPECT_EQ(WriteFd(-1, rgBytes, 10), 10);
   EXPECT_EQ(WriteFd(-1, "0123456789", 10) + WriteFd(-1, "0123456789", -5), 4);
   EXPECT_EQ(gTaken, "012345abcdefghij0123");
   EXPECT_EQ(gClock, usecStart + 21000);

@@ -208,12 +208,13 @@ std::string GetISO8601TimeText(int64_t TimeStamp) {
   return std::string(szTime) + szMSec;
 }
 
-int32_t WriteFd(int Fd, const char* pBuf, int32_t BufLen) {
+int32_t WriteFd(int Fd, const void* pBuf, int32_t BufLen) {
+  const char* const pBytes = static_cast<const char*>(pBuf);
   DelayTimer Timer(WRITE_RETRY_USEC);
   int32_t Written = 0;
   int EmptyWrites = 0;
   while (Written < BufLen) {
-    const ssize_t Len = write(Fd, pBuf + Written, static_cast<size_t>(BufLen - Written));
+    const ssize_t Len = write(Fd, pBytes + Written, static_cast<size_t>(BufLen - Written));
     if (Len > 0) {
       Written += static_cast<int32_t>(Len);
     } else if (Len == 0) {

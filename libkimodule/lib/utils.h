@@ -81,7 +81,7 @@ std::string GetISO8601TimeText(int64_t TimeStamp);
 // a descriptor that is not ready is tried again every 10 ms. Returns the number of bytes written:
 // fewer than BufLen after an error, which is logged (LOG_CATEG_UTILS, LOG_LEVEL_NOTICE), or when
 // nothing was taken six times.
-int32_t WriteFd(int Fd, const char* pBuf, int32_t BufLen);
+int32_t WriteFd(int Fd, const void* pBuf, int32_t BufLen);
 
 typedef void* (*ThreadFunc)(void* pParam);
 
