@@ -5,6 +5,10 @@
 
 #include <cstdint>
 
+// On 32-bit systems flags decide the size of time_t and timeval, which must be that of the library.
+static_assert(sizeof(time_t) == 8 && sizeof(timeval) == 16,
+              "compile with -D_FILE_OFFSET_BITS=64 -D_TIME_BITS=64, as the library is");
+
 // Paces one thread: each Delay() is one tick. Ticks are counted from where the last one was
 // planned, not from where it ended, so that what a sleep is late by does not add up. A plain value,
 // to be copied at will; not shared between threads.

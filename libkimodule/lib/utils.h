@@ -12,6 +12,10 @@
 #include <string>
 #include <vector>
 
+// On 32-bit systems flags decide the size of time_t and timeval, which must be that of the library.
+static_assert(sizeof(time_t) == 8 && sizeof(timeval) == 16,
+              "compile with -D_FILE_OFFSET_BITS=64 -D_TIME_BITS=64, as the library is");
+
 // The part of strFullPath after its last '/' or '\', or all of it when it has neither.
 std::string GetBaseName(const std::string& strFullPath);
 
