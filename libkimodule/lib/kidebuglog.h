@@ -168,6 +168,10 @@ KiDbgLogCfg* KiShmDbgLogCfgAt();
 // Attach the configuration to g_pDbgLogCfg, and detach it. A program that links the library does
 // not call them: they run by themselves, the one before main, after the program's global objects
 // are constructed, the other at normal exit, after they are destroyed.
+//
+// Two programs are exceptions. One that is linked to the shared library without kimodule_start has
+// to call both. In one that names the library's object files before its own, InitDbgCfg runs before
+// the global objects are constructed.
 void InitDbgCfg();
 void FreeDbgCfg();
 
