@@ -126,32 +126,23 @@ void ReplaceSubstr(std::string& strInput, const std::string& strSub,
 char* HttpBase64Encode(const char* src) {
   static const char szAlphabet[] =
       "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
-  // The two characters of each twelve bits.
-  static const auto Pairs = [] {
-    std::array<std::array<char, 2>, 4096> Made;
-    for (size_t Bits = 0; Bits < Made.size(); ++Bits) {
-      Made[Bits] = {szAlphabet[Bits >> 6], szAlphabet[Bits & 63]};
-    }
-    return Made;
-  }();
   const size_t Len = strlen(src);
   char* const szText = static_cast<char*>(malloc((Len + 2) / 3 * 4 + 1));
   if (szText == nullptr) {
     return nullptr;
   }
+  const auto* const pIn = reinterpret_cast<const unsigned char*>(src);
   char* pOut = szText;
-  for (size_t Done = 0; Done < Len; Done += 3, pOut += 4) {
-    const auto* pIn = reinterpret_cast<const unsigned char*>(src + Done);
-    const unsigned First = pIn[0];
-    const unsigned Second = pIn[1];
-    const unsigned Third = Done + 1 < Len ? pIn[2] : 0;  // the NUL stands for what is not there
-    memcpy(pOut, Pairs[First << 4 | Second >> 4].data(), 2);
-    memcpy(pOut + 2, Pairs[(Second & 15) << 8 | Third].data(), 2);
+  for (size_t Done = 0; Done < Len; Done += 3) {
+    const unsigned First = pIn[Done];
+    const unsigned Second = pIn[Done + 1];  // the terminating 0 where the text ends
+    const unsigned Third = Done + 1 < Len ? pIn[Done + 2] : 0;
+    *pOut++ = szAlphabet[First >> 2];
+    *pOut++ = szAlphabet[(First & 3) << 4 | Second >> 4];
+    *pOut++ = Done + 1 < Len ? szAlphabet[(Second & 15) << 2 | Third >> 6] : '=';
+    *pOut++ = Done + 2 < Len ? szAlphabet[Third & 63] : '=';
   }
   *pOut = '\0';
-  for (size_t Pad = Len; Pad % 3 != 0; ++Pad) {
-    *--pOut = '=';
-  }
   return szText;
 }
 
