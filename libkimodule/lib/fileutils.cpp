@@ -131,6 +131,7 @@ int WriteToFile(const char* szFile, const KEY_VAL_MAP& KeyVals, bool blQuoteVal)
     strText.append(strKey).append("=").append(szQuote).append(strVal).append(szQuote).append("\n");
   }
   if (WriteText(szFile, strText) != 0) {
+    // "wrtie": others search for this text
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to wrtie file [%s] with errno [%d].\n",
              szFile, errno);
     return -1;
