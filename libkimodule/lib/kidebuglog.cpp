@@ -22,7 +22,6 @@
 #include "kiflock.h"
 #include "utils.h"
 
-KiDbgLogCfg* g_pDbgLogCfg = nullptr;
 pid_t g_DbgLogPid = 0;
 
 // --- Names ---
@@ -321,14 +320,3 @@ int KiDbgLogCfg::FindPid(pid_t Pid, int Count) const {
 int KiShmDbgLogIPCKey() { return 0x18180004; }
 
 KiDbgLogCfg* KiShmDbgLogCfgAt() { return ShmAt<KiDbgLogCfg>(KiShmDbgLogIPCKey()); }
-
-void InitDbgCfg() { g_pDbgLogCfg = KiShmDbgLogCfgAt(); }
-
-void FreeDbgCfg() { ShmDt(g_pDbgLogCfg); }
-
-// In a static library these stand behind the program's own objects, and so run when those are
-// constructed. In a shared one they would run before: there kidebuglog_start.cpp takes their place.
-#ifndef KIMODULE_SHARED
-__attribute__((constructor)) static void AtStart() { InitDbgCfg(); }
-__attribute__((destructor)) static void AtExit() { FreeDbgCfg(); }
-#endif
