@@ -74,10 +74,12 @@ int Execute(DB_INSTANCE DBInstance, std::string strCommand, DBResult_tag** ppRes
              "Failed to execute db[%d] cmd: %s.\n", DBInstance, strCommand.c_str());
     Ret = -1;
   }
-  if (Ret == 0 && ppResult != nullptr && pCurrResult != nullptr) {
-    *ppResult = pCurrResult;
-  } else {
-    ZAMODBFreeResult(pCurrResult);
+  if (pCurrResult != nullptr) {
+    if (Ret == 0 && ppResult != nullptr) {
+      *ppResult = pCurrResult;
+    } else {
+      ZAMODBFreeResult(pCurrResult);
+    }
   }
   ZAMODBClose(pConn);
   return Ret;

@@ -352,18 +352,25 @@ static std::string AddSecondOutput(std::string strConnectedWire) {
   return strConnectedWire;
 }
 
+// Releases what it holds on every path, null too, as the database library allows.
+struct ResultOwner {
+  ResultOwner() = default;
+  ~ResultOwner() { KiDB::KiDBFreeResult(pResult); }
+  ResultOwner(const ResultOwner&) = delete;
+  ResultOwner& operator=(const ResultOwner&) = delete;
+  DBResult_tag* pResult = nullptr;
+};
+
 // Each statement is a transaction of its own. Every run adds one more "DO 2" row to each camera:
 // the version threshold is what keeps the action from running again.
 static int UpdateAxisA8105E() {
-  DBResult_tag* pFetched = nullptr;
+  ResultOwner Result;
   if (RunSql("SELECT id,id_on_rec_server,owner_ds_id,connected_wire from camera "
              "WHERE vendor='AXIS' AND model='A8105-E';",
-             &pFetched) != 0) {
+             &Result.pResult) != 0) {
     return -1;
   }
-  const std::unique_ptr<DBResult_tag, decltype(&KiDB::KiDBFreeResult)> pResult(
-      pFetched, KiDB::KiDBFreeResult);
-  const auto Rows = static_cast<int>(ZAMODBNumRows(pResult.get()));
+  const auto Rows = static_cast<int>(ZAMODBNumRows(Result.pResult));
   if (Rows <= 0) {
     KiPrintf(KI_LOG, nullptr, nullptr, __FILE__, __LINE__, __func__,
              "There's no info in camera table.\n");
@@ -371,16 +378,16 @@ static int UpdateAxisA8105E() {
   }
   for (int Idx = 0; Idx < Rows; ++Idx) {
     DBRow Row = 0;
-    if (ZAMODBFetchRow(pResult.get(), &Row) != 0) {
+    if (ZAMODBFetchRow(Result.pResult, &Row) != 0) {
       KiPrintf(KI_LOG, nullptr, nullptr, __FILE__, __LINE__, __func__,
                "Failed to get camera info.\n");
       return -1;
     }
-    const char* szWire = ZAMODBFetchField(pResult.get(), Row, "connected_wire");
+    const char* szWire = ZAMODBFetchField(Result.pResult, Row, "connected_wire");
     const std::string strConnectedWire = AddSecondOutput(szWire == nullptr ? "" : szWire);
-    const int Id = KiAtoi(ZAMODBFetchField(pResult.get(), Row, "id"));
-    const int IdOnRecServer = KiAtoi(ZAMODBFetchField(pResult.get(), Row, "id_on_rec_server"));
-    const int OwnerDsId = KiAtoi(ZAMODBFetchField(pResult.get(), Row, "owner_ds_id"));
+    const int Id = KiAtoi(ZAMODBFetchField(Result.pResult, Row, "id"));
+    const int IdOnRecServer = KiAtoi(ZAMODBFetchField(Result.pResult, Row, "id_on_rec_server"));
+    const int OwnerDsId = KiAtoi(ZAMODBFetchField(Result.pResult, Row, "owner_ds_id"));
 
     if (RunSql("UPDATE camera SET connected_wire='" + strConnectedWire +
                "' WHERE vendor='AXIS' AND model='A8105-E' AND id=" + itos(Id) + ";") != 0) {
