@@ -6,6 +6,7 @@
 #include <malloc.h>
 #include <sys/stat.h>
 
+#include <cstddef>
 #include <cstdint>
 #include <cstdio>
 #include <cstring>
@@ -508,9 +509,40 @@ static int UpgradeOnvifConfForContinuousPtzSpeed() {
   });
 }
 
-// --- The action tables, by ascending threshold ---
+// --- The action tables ---
 
-static const UPD_LIST grgCamveldDBUpgradeAction[] = {
+// A row that always runs may have any place; the others ascend past it.
+template <size_t Rows>
+static constexpr bool ThresholdsAscend(const UPD_LIST (&rgTable)[Rows]) {
+  uint32_t Highest = 0;
+  for (size_t Idx = 0; Idx + 1 < Rows; ++Idx) {
+    if (rgTable[Idx].orgVersion != 0 && rgTable[Idx].orgVersion < Highest) {
+      return false;
+    }
+    Highest = rgTable[Idx].orgVersion == 0 ? Highest : rgTable[Idx].orgVersion;
+  }
+  return true;
+}
+
+template <size_t Rows>
+static constexpr bool EndsWithNull(const UPD_LIST (&rgTable)[Rows]) {
+  return rgTable[Rows - 1].orgVersion == 0 && rgTable[Rows - 1].pFuncUpdate == nullptr;
+}
+
+// GCC folds no comparison of a function with null under UndefinedBehaviorSanitizer, one of null it
+// does.
+template <size_t Rows>
+static constexpr bool AllHaveActions(const UPD_LIST (&rgTable)[Rows]) {
+  for (size_t Idx = 0; Idx + 1 < Rows; ++Idx) {
+    if (__builtin_constant_p(rgTable[Idx].pFuncUpdate == nullptr) &&
+        rgTable[Idx].pFuncUpdate == nullptr) {
+      return false;
+    }
+  }
+  return true;
+}
+
+static constexpr UPD_LIST grgCamveldDBUpgradeAction[] = {
     {83, RenameAbusTvip62000Reso},
     {86, UpdateCameraModelConfRenameSiemens},
     {301, UpdateCameraModelRenameForHIKVISION},
@@ -544,12 +576,24 @@ static const UPD_LIST grgCamveldDBUpgradeAction[] = {
     {2475, UpdateReolinkRLC411And423Series},
     {0, nullptr},
 };
+static_assert(ThresholdsAscend(grgCamveldDBUpgradeAction),
+              "list the actions by ascending threshold");
+static_assert(EndsWithNull(grgCamveldDBUpgradeAction),
+              "the last row of an action table is {0, nullptr}");
+static_assert(AllHaveActions(grgCamveldDBUpgradeAction),
+              "only the last row of an action table has no action");
 
-static const UPD_LIST grgCamveldRemoteCapUpgradeAction[] = {
+static constexpr UPD_LIST grgCamveldRemoteCapUpgradeAction[] = {
     {68, UpgradeOnvifConfForPtzContinuousMove},
     {80, UpgradeOnvifConfForContinuousPtzSpeed},
     {0, nullptr},
 };
+static_assert(ThresholdsAscend(grgCamveldRemoteCapUpgradeAction),
+              "list the actions by ascending threshold");
+static_assert(EndsWithNull(grgCamveldRemoteCapUpgradeAction),
+              "the last row of an action table is {0, nullptr}");
+static_assert(AllHaveActions(grgCamveldRemoteCapUpgradeAction),
+              "only the last row of an action table has no action");
 
 static int DoAction(const UPD_LIST* pAction, uint32_t orgVer, int Idx) {
   const UPD_LIST& Row = pAction[Idx];
