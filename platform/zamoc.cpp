@@ -23,7 +23,7 @@ namespace {
 constexpr int DIR_LOCK_TIMEOUT_SEC = 10;
 constexpr off_t MAX_FILE_SIZE = off_t{16} * 1024 * 1024;
 constexpr const char* BLANKS = " \t";
-constexpr const char* TMP_NAME = "/.tesselupgrader.tmp";
+constexpr const char* TMP_NAME = "/.zamoc.tmp";
 constexpr const char* OPEN_STEP = "open";
 
 // --- Files ---
@@ -450,4 +450,4 @@ int ZAMOCFileRemoveKey(const char* szFile, const char* szKey) {
   return ZAMOCFileChangeKeys(szFile, &Change, 1) == 0 ? 1 : -1;
 }
 
-void ZAMOCCopyright() { puts(TESSEL_NAME " " TESSEL_VERSION); }
+void ZAMOCCopyright() { puts(ZAMOC_BANNER); }

@@ -8,7 +8,7 @@
 // Only regular files of up to 16 MiB, or links to them, are ever opened; anything else holds no
 // keys. A changed file is replaced as a whole: whatever happens, the path leads to the old or to
 // the new content, with the owner, group and mode it had, and the new one is on stable storage
-// before a call returns success. Until it gets its name it is .tesselupgrader.tmp beside the file;
+// before a call returns success. Until it gets its name it is .zamoc.tmp beside the file;
 // one that a killed process leaves holds no keys, and goes with the next change in its directory.
 // Callers that change files of one directory, in any process, take turns and wait up to ten seconds
 // for theirs. Each thread keeps the text of the file that it read last, to be asked for further
@@ -47,5 +47,5 @@ struct ZAMOCKeyChange {
 // file: all of them are made or none. Returns 0, or -1 on failure, as above.
 int ZAMOCFileChangeKeys(const char* szFile, const ZAMOCKeyChange* pChanges, size_t Count);
 
-// Writes one line with the tool's name and version to standard output.
+// Writes the program's banner, one line that its build defines as ZAMOC_BANNER, to standard output.
 void ZAMOCCopyright();

@@ -83,10 +83,10 @@ TEST_F(CapabilityFile, ReplacementIsWholeAndNotWithoutNeed) {
   // user's namespace knows no second owner.
   const string strCd = "cd " + CAP_DIR + "; stat -c '%a %u %g' file; ";
   RunCommand(strCd +
-             "echo k=1 | tee .tesselupgrader.tmp >file; chown 12:34 file; chmod 6741 file; "
+             "echo k=1 | tee .zamoc.tmp >file; chown 12:34 file; chmod 6741 file; "
              "ln file /var/old; ln -s $PWD/file /var/link; mkfifo fifo");
   const string strBefore = RunCommand(strCd);
-  EXPECT_EQ(Get(szNone) + Get(CAP_DIR + "/fifo") + Get(CAP_DIR + "/.tesselupgrader.tmp"),
+  EXPECT_EQ(Get(szNone) + Get(CAP_DIR + "/fifo") + Get(CAP_DIR + "/.zamoc.tmp"),
             "-1 -1 -1 ");
   EXPECT_EQ(ZAMOCFileSetKeyValue(szNone, "k", "2", szFormat), -1);
   EXPECT_EQ(ZAMOCFileRemoveKey(szNone, "k"), -1);

@@ -121,7 +121,7 @@ TEST_F(Upgrade, WritesOnlyItsFiles) {
       ASAN_OPTIONS=detect_leaks=0 strace -fo trace -e %file $T 0; echo $?
       grep -E ' open.*O_(WRONLY|RDWR|CREAT)| (rename|unlink|link|sym|mk|trunc|ch)' trace |
         cut -d '"' -f 2 | grep -v ^/tmp/tsan | LC_ALL=C sort -u >written # but ThreadSanitizer's
-      printf '%s\n' $L $C/.tesselupgrader.tmp $D $D-journal | diff written -)sh");
+      printf '%s\n' $L $C/.zamoc.tmp $D $D-journal | diff written -)sh");
   EXPECT_EQ(strIs, "0\n");
 }
 
