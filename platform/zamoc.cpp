@@ -351,7 +351,8 @@ int ReplaceFile(const std::string& strReal, const std::string& strDir, int DirFd
   if (New.RenameTo(strReal) != 0) {
     return ReportFailure(szFile, "rename");
   }
-  if (fsync(DirFd) != 0) {
+  // Some file systems cannot sync a directory, and say so; that is no failure.
+  if (fsync(DirFd) != 0 && errno != EINVAL) {
     return ReportFailure(szFile, "fsync of the directory");
   }
   return 0;

@@ -8,12 +8,12 @@
 // Only regular files of up to 16 MiB, or links to them, are ever opened; anything else holds no
 // keys. A changed file is replaced as a whole: whatever happens, the path leads to the old or to
 // the new content, with the owner, group and mode it had, and the new one is on stable storage
-// before a call returns success. Until it gets its name it is .zamoc.tmp beside the file;
-// one that a killed process leaves holds no keys, and goes with the next change in its directory.
-// Callers that change files of one directory, in any process, take turns and wait up to ten seconds
-// for theirs. Each thread keeps the text of the file that it read last, to be asked for further
-// keys. Why a file could not be read or changed goes to syslog at LOG_ERR. Any thread may call any
-// of these.
+// before a call returns success, unless the file system cannot sync a directory. Until it gets its
+// name it is .zamoc.tmp beside the file; one that a killed process leaves holds no keys, and goes
+// with the next change in its directory. Callers that change files of one directory, in any
+// process, take turns and wait up to ten seconds for theirs. Each thread keeps the text of the file
+// that it read last, to be asked for further keys. Why a file could not be read or changed goes to
+// syslog at LOG_ERR. Any thread may call any of these.
 #pragma once
 
 #include <cstddef>

@@ -105,6 +105,18 @@ TEST_F(Upgrade, CapabilityFilesChangeByTheirOwnKeys) {
             " continuous|ptz_speed_max = 1\n");
 }
 
+// EINVAL says that the file system cannot sync directories.
+TEST_F(Upgrade, OnlyAFailedSyncOfTheDirectoryStopsTheWalk) {
+  for (const auto& [strErrno, strEnd] :
+       {std::pair("EINVAL", "0\n2\n"), {"EIO", "255\n1\n"}, {"ENOSPC", "255\n1\n"}}) {
+    const string strRun = "rm $C/*; echo ptz_continuous_move=yes | tee $C/a >$C/b\n";
+    EXPECT_EQ(RunCommand(strRun + "ASAN_OPTIONS=detect_leaks=0 strace -fo trace -P $C" +
+                         " -e inject=fsync:error=" + strErrno +
+                         " $T --updateCap $C; echo $?; find $C -type f -empty | wc -l"),
+              strEnd);
+  }
+}
+
 TEST_F(Upgrade, LargeCapabilityDirectoryThatOthersChange) {
   const string strIs = RunCommand(R"sh(
       rm $C/*; cd $C; seq 100000 | xargs touch; echo pan=yes | tee a z >/var/pan
