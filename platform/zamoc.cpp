@@ -16,13 +16,18 @@
 #include <string_view>
 #include <vector>
 
+#include "caplines.h"
 #include "kiflock.h"
+
+using caplines::Change;
+using caplines::ChangeLines;
+using caplines::FindKey;
+using caplines::FormatLine;
 
 namespace {
 
 constexpr int DIR_LOCK_TIMEOUT_SEC = 10;
 constexpr off_t MAX_FILE_SIZE = off_t{16} * 1024 * 1024;
-constexpr const char* BLANKS = " \t";
 constexpr const char* TMP_NAME = "/.zamoc.tmp";
 constexpr const char* OPEN_STEP = "open";
 
@@ -202,119 +207,13 @@ bool HoldsNoKeys(const char* szStep, int Errno) {
          (Errno == EINVAL || Errno == EFBIG || Errno == ENOENT || Errno == ELOOP);
 }
 
-// --- Lines, which keep their line feeds and may hold any bytes ---
-
-// Takes the first line, with its line feed, off a text that is not empty.
-std::string_view TakeLine(std::string_view* pText) {
-  const size_t Feed = pText->find('\n');
-  const std::string_view Line = pText->substr(0, Feed == std::string_view::npos ? Feed : Feed + 1);
-  pText->remove_prefix(Line.size());
-  return Line;
-}
-
-std::string_view TrimBlanks(std::string_view Text) {
-  const size_t First = Text.find_first_not_of(BLANKS);
-  if (First == std::string_view::npos) {
-    return "";
-  }
-  return Text.substr(First, Text.find_last_not_of(BLANKS) - First + 1);
-}
-
-// The key of a line, empty when it has none.
-std::string_view KeyOf(std::string_view Line) {
-  const size_t Equals = Line.find('=');
-  if (Equals == std::string_view::npos || Line[0] == '#') {
-    return "";
-  }
-  return TrimBlanks(Line.substr(0, Equals));
-}
-
-std::string_view ValueOf(std::string_view Line) {
-  for (const char LineEnd : {'\n', '\r'}) {
-    if (!Line.empty() && Line.back() == LineEnd) {
-      Line.remove_suffix(1);
-    }
-  }
-  std::string_view Value = TrimBlanks(Line.substr(Line.find('=') + 1));
-  if (Value.size() >= 2 && Value.front() == '"' && Value.back() == '"') {
-    Value = Value.substr(1, Value.size() - 2);
-  }
-  return Value;
-}
-
-// Fills the two "%s" of strFormat. Returns nothing when it has not exactly two, or when they do not
-// make one line of that key.
-std::string FormatLine(const std::string& strFormat, const std::string& strKey,
-                       const std::string& strValue) {
-  const size_t Key = strFormat.find("%s");
-  const size_t Value = Key == std::string::npos ? Key : strFormat.find("%s", Key + 2);
-  if (Value == std::string::npos || std::count(strFormat.begin(), strFormat.end(), '%') != 2) {
-    return "";
-  }
-  std::string strLine = strFormat.substr(0, Key) + strKey +
-                        strFormat.substr(Key + 2, Value - Key - 2) + strValue +
-                        strFormat.substr(Value + 2);
-  const bool blOneLine = strLine.find('\n') == strLine.size() - 1;
-  return blOneLine && KeyOf(strLine) == strKey ? strLine : "";
-}
-
-// Whether there is a line of that key; *pValue is then the value of the first. Only lines that the
-// key stands in are looked at.
-bool FindKey(std::string_view Text, std::string_view Key, std::string_view* pValue) {
-  size_t Pos = Key.empty() ? std::string_view::npos : Text.find(Key);
-  while (Pos != std::string_view::npos) {
-    Text.remove_prefix(Text.rfind('\n', Pos) + 1);
-    const std::string_view Line = TakeLine(&Text);
-    if (KeyOf(Line) == Key) {
-      *pValue = ValueOf(Line);
-      return true;
-    }
-    Pos = Text.find(Key);
-  }
-  return false;
-}
-
 // --- Changes ---
-
-struct CHANGE {
-  std::string strKey;
-  std::string strNewLine;  // empty: the key is taken out
-  bool blFound = false;
-};
 
 int ReportFailure(const char* szFile, const char* szStep) {
   const int Errno = errno;
   syslog(LOG_ERR, "zamoc: [%s]: %s failed with errno [%d]", szFile, szStep, Errno);
   errno = Errno;
   return -1;
-}
-
-// The text with the changes made.
-std::string Changed(std::string_view Text, std::vector<CHANGE> Changes) {
-  std::string strNew;
-  strNew.reserve(Text.size());
-  while (!Text.empty()) {
-    std::string_view Line = TakeLine(&Text);
-    const std::string_view Key = KeyOf(Line);
-    const auto Change = std::find_if(Changes.begin(), Changes.end(),
-                                     [&](const CHANGE& It) { return It.strKey == Key; });
-    if (Change != Changes.end()) {
-      // A repeat of a key that was set goes the way of one that is taken out.
-      Line = Change->blFound ? "" : std::string_view(Change->strNewLine);
-      Change->blFound = true;
-    }
-    strNew += Line;
-  }
-  for (const CHANGE& Change : Changes) {
-    if (Change.blFound || Change.strNewLine.empty()) {
-      continue;
-    }
-    if (!strNew.empty() && strNew.back() != '\n') {
-      strNew += '\n';
-    }
-    strNew += Change.strNewLine;
-  }
-  return strNew;
 }
 
 int SetOwnerAndMode(int Fd, const struct stat& Stat) {
@@ -327,7 +226,7 @@ int SetOwnerAndMode(int Fd, const struct stat& Stat) {
 // Replaces the file strReal in the directory behind DirFd by its changed copy. The order makes it
 // hold through a power cut: the content is on stable storage before it gets its name.
 int ReplaceFile(const std::string& strReal, const std::string& strDir, int DirFd,
-                const std::vector<CHANGE>& Changes) {
+                const std::vector<Change>& Changes) {
   const char* szFile = strReal.c_str();
   const char* szStep;
   struct stat Stat;
@@ -339,7 +238,7 @@ int ReplaceFile(const std::string& strReal, const std::string& strDir, int DirFd
   if (New.Get() == -1) {
     return ReportFailure(szFile, "creation of a temporary file");
   }
-  if (WriteAll(New.Get(), Changed(*pText, Changes)) != 0) {
+  if (WriteAll(New.Get(), ChangeLines(*pText, Changes)) != 0) {
     return ReportFailure(szFile, "copy");
   }
   if (SetOwnerAndMode(New.Get(), Stat) != 0) {
@@ -363,7 +262,7 @@ bool IsLink(const char* szFile) {
   return lstat(szFile, &Stat) == 0 && S_ISLNK(Stat.st_mode);
 }
 
-int ChangeFile(const char* szFile, const std::vector<CHANGE>& Changes) {
+int ChangeFile(const char* szFile, const std::vector<Change>& Changes) {
   std::string strReal = szFile;
   if (strReal.find('/') == std::string::npos || IsLink(szFile)) {
     // A link stays: the file it leads to is the one that is replaced.
@@ -411,18 +310,18 @@ int ZAMOCFileChangeKeys(const char* szFile, const ZAMOCKeyChange* pChanges, size
   if (szFile == nullptr || pChanges == nullptr) {
     return -1;
   }
-  std::vector<CHANGE> Changes;
+  std::vector<Change> Changes;
   for (const ZAMOCKeyChange* pChange = pChanges; pChange != pChanges + Count; ++pChange) {
-    CHANGE Change;
-    Change.strKey = pChange->szKey == nullptr ? "" : pChange->szKey;
+    Change New;
+    New.strKey = pChange->szKey == nullptr ? "" : pChange->szKey;
     if (pChange->szValue != nullptr && pChange->szFormat != nullptr) {
-      Change.strNewLine = FormatLine(pChange->szFormat, Change.strKey, pChange->szValue);
+      New.strNewLine = FormatLine(pChange->szFormat, New.strKey, pChange->szValue);
     }
-    if (Change.strKey.empty() || Change.strNewLine.empty() != (pChange->szValue == nullptr)) {
+    if (New.strKey.empty() || New.strNewLine.empty() != (pChange->szValue == nullptr)) {
       errno = EINVAL;
       return ReportFailure(szFile, "change of a key");
     }
-    Changes.push_back(Change);
+    Changes.push_back(New);
   }
   return ChangeFile(szFile, Changes);
 }
