@@ -15,6 +15,7 @@
 #include <string>
 #include <vector>
 
+#include "fileops.h"
 #include "kidb.h"
 #include "kidebuglog.h"
 #include "strtoint32.h"
@@ -428,18 +429,19 @@ static int UpdateReolinkRLC411And423Series() {
 
 // --- Capability files ---
 
-// The value of strKey, or nothing when there is none or, which sets *pblUnread, it cannot be read.
-static std::string GetConfKeyValue(const std::string& strFilePath, const std::string& strKey,
-                                   bool* pblUnread) {
+// The value of strKey; nothing when the key or the file is missing, or the file cannot be read.
+static std::string GetConfKeyValue(const std::string& strFilePath, const std::string& strKey) {
   char szValue[512] = "";
   const int Len =
       ZAMOCFileGetKeyValue(strFilePath.c_str(), strKey.c_str(), szValue, sizeof(szValue), 0);
-  *pblUnread = *pblUnread || Len < 0;
   return Len > 0 ? szValue : "";
 }
 
 struct DirCloser {
-  void operator()(DIR* pDir) const { closedir(pDir); }
+  void operator()(DIR* pDir) const {
+    const fileops::NoCancel Guard;
+    closedir(pDir);
+  }
 };
 
 // Calls pUpgradeFile for every entry of the capability directory, whatever its type or name, until
@@ -467,41 +469,37 @@ static int ForEachCapFile(int (*pUpgradeFile)(const std::string& strFilePath)) {
   return 0;
 }
 
-// A file's changes are made in one replacement, and only when all of its keys could be read: a file
-// that is left between the marker and the axes would let the next run take a continuous axis for a
-// stepping one.
+// A file's changes are made in one replacement: a file that is left between the marker and the axes
+// would let the next run take a continuous axis for a stepping one.
 static int UpgradeOnvifConfForPtzContinuousMove() {
   return ForEachCapFile([](const std::string& strFilePath) {
+    const ZAMOCReading Reading(strFilePath);
     std::vector<ZAMOCKeyChange> Changes;
-    bool blUnread = false;
-    const bool blPtzContinuousMove =
-        GetConfKeyValue(strFilePath, "ptz_continuous_move", &blUnread) == "yes";
+    const bool blPtzContinuousMove = GetConfKeyValue(strFilePath, "ptz_continuous_move") == "yes";
     if (blPtzContinuousMove) {
       Changes.push_back({"ptz_continuous_move", nullptr, nullptr});
     }
     for (const char* szAxis : {"pan", "tilt", "zoom"}) {
-      if (GetConfKeyValue(strFilePath, szAxis, &blUnread) == "yes") {
+      if (GetConfKeyValue(strFilePath, szAxis) == "yes") {
         Changes.push_back({szAxis, blPtzContinuousMove ? "continuous" : "step", "%s= %s\n"});
       }
     }
     if (Changes.empty()) {
       return 0;
     }
-    const int Err =
-        blUnread ? -1 : ZAMOCFileChangeKeys(strFilePath.c_str(), Changes.data(), Changes.size());
+    const int Err = ZAMOCFileChangeKeys(strFilePath.c_str(), Changes.data(), Changes.size());
     return blPtzContinuousMove ? Err : 0;  // only the marker's removal has to succeed
   });
 }
 
 static int UpgradeOnvifConfForContinuousPtzSpeed() {
   return ForEachCapFile([](const std::string& strFilePath) {
-    bool blUnread = false;
-    // A speed that is there but cannot be read must not be replaced.
-    if (!GetConfKeyValue(strFilePath, "ptz_speed_max", &blUnread).empty() || blUnread) {
+    const ZAMOCReading Reading(strFilePath);
+    if (!GetConfKeyValue(strFilePath, "ptz_speed_max").empty()) {
       return 0;
     }
-    const bool blSupportPtzSpeed = GetConfKeyValue(strFilePath, "pan", &blUnread) == "continuous" ||
-                                   GetConfKeyValue(strFilePath, "tilt", &blUnread) == "continuous";
+    const bool blSupportPtzSpeed = GetConfKeyValue(strFilePath, "pan") == "continuous" ||
+                                   GetConfKeyValue(strFilePath, "tilt") == "continuous";
     if (blSupportPtzSpeed) {
       ZAMOCFileSetKeyValue(strFilePath.c_str(), "ptz_speed_max", "1", "%s = %s\n");
     }

@@ -7,16 +7,15 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
-#include <ctime>
 #include <memory>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "caplines.h"
+#include "fileops.h"
 #include "kiflock.h"
 
 using caplines::Change;
@@ -27,71 +26,16 @@ using caplines::FormatLine;
 namespace {
 
 constexpr int DIR_LOCK_TIMEOUT_SEC = 10;
-constexpr off_t MAX_FILE_SIZE = off_t{16} * 1024 * 1024;
+constexpr size_t MAX_FILE_SIZE = size_t{16} * 1024 * 1024;
 constexpr const char* TMP_NAME = "/.zamoc.tmp";
-constexpr const char* OPEN_STEP = "open";
 
-// --- Files ---
+// --- Reading ---
 
-class Descriptor {
- public:
-  explicit Descriptor(int Fd) : m_Fd(Fd) {}
-  ~Descriptor() {
-    const int Errno = errno;  // what made the caller give up
-    if (m_Fd != -1) {
-      close(m_Fd);
-    }
-    errno = Errno;
-  }
-  Descriptor(const Descriptor&) = delete;
-  Descriptor& operator=(const Descriptor&) = delete;
-  int Get() const { return m_Fd; }
-
- private:
-  const int m_Fd;
-};
-
-// A file that disappears with the object unless it was given its final name. Only whoever holds the
-// directory's lock makes one, so one that is already there was left behind by a killed process.
-class TmpFile {
- public:
-  explicit TmpFile(const std::string& strDir) : m_strName(strDir + TMP_NAME) {
-    m_Fd = Create();
-    if (m_Fd == -1 && errno == EEXIST && unlink(m_strName.c_str()) == 0) {
-      m_Fd = Create();
-    }
-    m_blUnnamed = m_Fd != -1;
-  }
-  ~TmpFile() {
-    if (m_Fd != -1) {
-      close(m_Fd);
-    }
-    if (m_blUnnamed) {
-      unlink(m_strName.c_str());
-    }
-  }
-  TmpFile(const TmpFile&) = delete;
-  TmpFile& operator=(const TmpFile&) = delete;
-
-  // -1 when it could not be created.
-  int Get() const { return m_Fd; }
-
-  int RenameTo(const std::string& strName) {
-    if (rename(m_strName.c_str(), strName.c_str()) != 0) {
-      return -1;
-    }
-    m_blUnnamed = false;
-    return 0;
-  }
-
- private:
-  int Create() const {
-    return open(m_strName.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600);
-  }
-
-  const std::string m_strName;
-  int m_Fd = -1;
-  bool m_blUnnamed = false;  // it is there, and has only its temporary name
+enum class ReadResult {
+  Read,
+  NoCapabilityFile,  // its name leads to nothing that may hold keys
+  OpenFailed,
+  ReadFailed,
 };
 
 // What a killed process left behind is nobody's capability file: the next change in its directory
@@ -108,113 +52,80 @@ int CheckFile(const struct stat& Stat) {
     errno = EINVAL;
     return -1;
   }
-  if (Stat.st_size > MAX_FILE_SIZE) {
+  if (Stat.st_size > static_cast<off_t>(MAX_FILE_SIZE)) {
     errno = EFBIG;
     return -1;
   }
   return 0;
 }
 
-// Reads a file to its end. Returns 0, or -1 with errno, also when it grows too large.
-int ReadAll(int Fd, std::string* pText) {
-  char rgBuf[16384];
-  ssize_t Len;
-  pText->clear();
-  while ((Len = read(Fd, rgBuf, sizeof(rgBuf))) > 0) {
-    pText->append(rgBuf, static_cast<size_t>(Len));
-    if (pText->size() > static_cast<size_t>(MAX_FILE_SIZE)) {
+// Opening anything but a regular file could hang (a FIFO) or have effects (a device), so it is
+// looked at first. Returns a descriptor and the file's size, or -1 with errno.
+int OpenCapabilityFile(const std::string& strFile, size_t* pSize) {
+  if (IsTmpFile(strFile)) {
+    errno = EINVAL;
+    return -1;
+  }
+  struct stat Stat;
+  if (stat(strFile.c_str(), &Stat) != 0 || CheckFile(Stat) != 0) {
+    return -1;
+  }
+  *pSize = static_cast<size_t>(Stat.st_size);
+  return open(strFile.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
+}
+
+// Reads a file of about Size bytes to its end. Returns 0, or -1 with errno, also when it grows too
+// large.
+int ReadAll(int Fd, size_t Size, std::string* pText) {
+  size_t Len = 0;
+  pText->resize(Size + 1);  // a byte more, to see the end by the same read
+  for (;;) {
+    const ssize_t Count = read(Fd, pText->data() + Len, pText->size() - Len);
+    if (Count == -1) {
+      return -1;
+    }
+    Len += static_cast<size_t>(Count);
+    if (Len > MAX_FILE_SIZE) {
       errno = EFBIG;
       return -1;
     }
-  }
-  return Len == 0 ? 0 : -1;
-}
-
-// The file that the thread read last: mostly one key after the other is asked for. It is empty when
-// a further change of the file might not show in its status.
-struct LAST_FILE {
-  struct stat Stat;
-  std::string strText;
-};
-thread_local LAST_FILE gLastFile;
-
-bool IsEqual(const timespec& A, const timespec& B) {
-  return A.tv_sec == B.tv_sec && A.tv_nsec == B.tv_nsec;
-}
-
-bool IsUnchanged(const struct stat& Then, const struct stat& Now) {
-  return Then.st_ino == Now.st_ino && Then.st_dev == Now.st_dev && Then.st_size == Now.st_size &&
-         IsEqual(Then.st_mtim, Now.st_mtim) && IsEqual(Then.st_ctim, Now.st_ctim);
-}
-
-// Whether a change from now on would get another time: the clock that files get theirs from has
-// moved on, by two seconds where a file system counts whole ones.
-bool IsSettled(const struct stat& Stat) {
-  timespec Now;
-  clock_gettime(CLOCK_REALTIME_COARSE, &Now);
-  const int64_t AgeNsec = (int64_t{Now.tv_sec} - Stat.st_ctim.tv_sec) * 1000000000 +
-                          (Now.tv_nsec - Stat.st_ctim.tv_nsec);
-  return AgeNsec > (Stat.st_ctim.tv_nsec == 0 ? 2000000000 : 0);
-}
-
-// Returns the text of a capability file, valid until the thread's next call, and the file's status
-// in *pStat; or null with errno and in *pszStep what failed.
-//
-// Opening anything but a regular file could hang (a FIFO) or have effects (a device), so it is
-// looked at first, and again once open.
-const std::string* ReadFile(const char* szFile, struct stat* pStat, const char** pszStep) {
-  *pszStep = OPEN_STEP;
-  if (stat(szFile, pStat) != 0 || CheckFile(*pStat) != 0) {
-    return nullptr;
-  }
-  if (IsTmpFile(szFile)) {
-    errno = EINVAL;
-    return nullptr;
-  }
-  if (IsUnchanged(gLastFile.Stat, *pStat)) {
-    return &gLastFile.strText;
-  }
-  gLastFile.Stat = {};
-  const Descriptor File(open(szFile, O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-  if (File.Get() == -1 || fstat(File.Get(), pStat) != 0 || CheckFile(*pStat) != 0) {
-    return nullptr;
-  }
-  const bool blSettled = IsSettled(*pStat);
-  *pszStep = "read";
-  if (ReadAll(File.Get(), &gLastFile.strText) != 0) {
-    return nullptr;
-  }
-  if (blSettled && gLastFile.strText.size() == static_cast<size_t>(pStat->st_size)) {
-    gLastFile.Stat = *pStat;
-  }
-  return &gLastFile.strText;
-}
-
-int WriteAll(int Fd, std::string_view Text) {
-  while (!Text.empty()) {
-    const ssize_t Len = write(Fd, Text.data(), Text.size());
-    if (Len == -1) {
-      return -1;
+    if (Count == 0 || Len == Size) {
+      pText->resize(Len);
+      return 0;
     }
-    Text.remove_prefix(static_cast<size_t>(Len));
+    if (Len == pText->size()) {
+      pText->resize(2 * Len);
+    }
   }
-  return 0;
 }
 
-// Whether it is the name, and no failure, that kept ReadFile from opening.
-bool HoldsNoKeys(const char* szStep, int Errno) {
-  return szStep == OPEN_STEP &&
-         (Errno == EINVAL || Errno == EFBIG || Errno == ENOENT || Errno == ELOOP);
+// Reads a capability file's text and, unless pStat is null, the status of what was opened. Unless
+// the result is Read, errno says why, and the text is of no use.
+ReadResult ReadFile(const std::string& strFile, std::string* pText, struct stat* pStat) {
+  size_t Size = 0;
+  const fileops::Descriptor File(OpenCapabilityFile(strFile, &Size));
+  if (File.Get() == -1 ||
+      (pStat != nullptr && (fstat(File.Get(), pStat) != 0 || CheckFile(*pStat) != 0))) {
+    const bool blByName = errno == EINVAL || errno == EFBIG || errno == ENOENT || errno == ELOOP;
+    return blByName ? ReadResult::NoCapabilityFile : ReadResult::OpenFailed;
+  }
+  if (ReadAll(File.Get(), Size, pText) != 0) {
+    return ReadResult::ReadFailed;
+  }
+  return ReadResult::Read;
+}
+
+int ReportFailure(const std::string& strFile, const char* szStep) {
+  const fileops::ErrnoKeeper Errno;
+  syslog(LOG_ERR, "zamoc: [%s]: %s failed with errno [%d]", strFile.c_str(), szStep, Errno.Get());
+  return -1;
+}
+
+int ReportFailure(const std::string& strFile, ReadResult Result) {
+  return ReportFailure(strFile, Result == ReadResult::ReadFailed ? "read" : "open");
 }
 
 // --- Changes ---
-
-int ReportFailure(const char* szFile, const char* szStep) {
-  const int Errno = errno;
-  syslog(LOG_ERR, "zamoc: [%s]: %s failed with errno [%d]", szFile, szStep, Errno);
-  errno = Errno;
-  return -1;
-}
 
 int SetOwnerAndMode(int Fd, const struct stat& Stat) {
   if (fchown(Fd, Stat.st_uid, Stat.st_gid) != 0) {
@@ -223,36 +134,38 @@ int SetOwnerAndMode(int Fd, const struct stat& Stat) {
   return fchmod(Fd, Stat.st_mode & 07777);
 }
 
-// Replaces the file strReal in the directory behind DirFd by its changed copy. The order makes it
+// Replaces strFile in the directory behind DirFd by its changed copy. The order makes it
 // hold through a power cut: the content is on stable storage before it gets its name.
-int ReplaceFile(const std::string& strReal, const std::string& strDir, int DirFd,
+int ReplaceFile(const std::string& strFile, const std::string& strDir, int DirFd,
                 const std::vector<Change>& Changes) {
-  const char* szFile = strReal.c_str();
-  const char* szStep;
+  std::string strText;
   struct stat Stat;
-  const std::string* pText = ReadFile(szFile, &Stat, &szStep);
-  if (pText == nullptr) {
-    return ReportFailure(szFile, szStep);
+  const ReadResult Result = ReadFile(strFile, &strText, &Stat);
+  if (Result != ReadResult::Read) {
+    return ReportFailure(strFile, Result);
   }
-  TmpFile New(strDir);
+  strText = ChangeLines(strText, Changes);
+  const std::string strNew = strDir + TMP_NAME;
+  const fileops::Descriptor New(fileops::CreateAnew(strNew.c_str()));
   if (New.Get() == -1) {
-    return ReportFailure(szFile, "creation of a temporary file");
+    return ReportFailure(strFile, "creation of a temporary file");
   }
-  if (WriteAll(New.Get(), ChangeLines(*pText, Changes)) != 0) {
-    return ReportFailure(szFile, "copy");
+  fileops::TmpFile NewName(strNew);
+  if (fileops::WriteAll(New.Get(), strText.data(), strText.size()) != 0) {
+    return ReportFailure(strFile, "copy");
   }
   if (SetOwnerAndMode(New.Get(), Stat) != 0) {
-    return ReportFailure(szFile, "copy of owner and mode");
+    return ReportFailure(strFile, "copy of owner and mode");
   }
   if (fsync(New.Get()) != 0) {
-    return ReportFailure(szFile, "fsync");
+    return ReportFailure(strFile, "fsync");
   }
-  if (New.RenameTo(strReal) != 0) {
-    return ReportFailure(szFile, "rename");
+  if (NewName.RenameTo(strFile.c_str()) != 0) {
+    return ReportFailure(strFile, "rename");
   }
   // Some file systems cannot sync a directory, and say so; that is no failure.
   if (fsync(DirFd) != 0 && errno != EINVAL) {
-    return ReportFailure(szFile, "fsync of the directory");
+    return ReportFailure(strFile, "fsync of the directory");
   }
   return 0;
 }
@@ -273,7 +186,7 @@ int ChangeFile(const char* szFile, const std::vector<Change>& Changes) {
     strReal = pReal.get();
   }
   const std::string strDir = strReal.substr(0, std::max<size_t>(strReal.rfind('/'), 1));
-  const Descriptor Dir(open(strDir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  const fileops::Descriptor Dir(open(strDir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (Dir.Get() == -1) {
     return ReportFailure(szFile, "open of the directory");
   }
@@ -286,24 +199,51 @@ int ChangeFile(const char* szFile, const std::vector<Change>& Changes) {
 
 }  // namespace
 
+thread_local const ZAMOCReading* ZAMOCReading::m_pInnermost = nullptr;
+
+ZAMOCReading::ZAMOCReading(const std::string& strFile)
+    : m_strFile(strFile), m_pOuter(m_pInnermost) {
+  const ReadResult Result = ReadFile(m_strFile, &m_strText, nullptr);
+  m_blRead = Result == ReadResult::Read;
+  if (!m_blRead && Result != ReadResult::NoCapabilityFile) {
+    ReportFailure(m_strFile, Result);
+  }
+  m_pInnermost = this;
+}
+
+ZAMOCReading::~ZAMOCReading() { m_pInnermost = m_pOuter; }
+
+const ZAMOCReading* ZAMOCReading::Find(const char* szFile) {
+  const ZAMOCReading* pReading = m_pInnermost;
+  while (pReading != nullptr && pReading->m_strFile != szFile) {
+    pReading = pReading->m_pOuter;
+  }
+  return pReading;
+}
+
+int ZAMOCReading::GetKeyValue(const char* szKey, char* szValue, size_t Size) const {
+  szValue[0] = '\0';
+  if (!m_blRead) {
+    return -1;
+  }
+  std::string_view Value;
+  if (!FindKey(m_strText, szKey, &Value)) {
+    return 0;
+  }
+  szValue[Value.copy(szValue, Size - 1)] = '\0';
+  return static_cast<int>(Value.size());
+}
+
 int ZAMOCFileGetKeyValue(const char* szFile, const char* szKey, char* szValue, size_t Size,
                          int /*Flags*/) {
   if (szFile == nullptr || szKey == nullptr || szValue == nullptr || Size == 0) {
     return -1;
   }
-  szValue[0] = '\0';
-  const char* szStep;
-  struct stat Stat;
-  const std::string* pText = ReadFile(szFile, &Stat, &szStep);
-  if (pText == nullptr) {
-    return HoldsNoKeys(szStep, errno) ? -1 : ReportFailure(szFile, szStep);
+  const ZAMOCReading* pReading = ZAMOCReading::Find(szFile);
+  if (pReading != nullptr) {
+    return pReading->GetKeyValue(szKey, szValue, Size);
   }
-  std::string_view Value;
-  if (!FindKey(*pText, szKey, &Value)) {
-    return 0;
-  }
-  szValue[Value.copy(szValue, Size - 1)] = '\0';
-  return static_cast<int>(Value.size());
+  return ZAMOCReading(szFile).GetKeyValue(szKey, szValue, Size);
 }
 
 int ZAMOCFileChangeKeys(const char* szFile, const ZAMOCKeyChange* pChanges, size_t Count) {
@@ -336,14 +276,13 @@ int ZAMOCFileRemoveKey(const char* szFile, const char* szKey) {
   if (szFile == nullptr || szKey == nullptr) {
     return -1;
   }
-  const char* szStep;
-  struct stat Stat;
-  const std::string* pText = ReadFile(szFile, &Stat, &szStep);
-  if (pText == nullptr) {
-    return ReportFailure(szFile, szStep);
+  std::string strText;
+  const ReadResult Result = ReadFile(szFile, &strText, nullptr);
+  if (Result != ReadResult::Read) {
+    return ReportFailure(szFile, Result);
   }
   std::string_view Value;
-  if (!FindKey(*pText, szKey, &Value)) {
+  if (!FindKey(strText, szKey, &Value)) {
     return 0;
   }
   const ZAMOCKeyChange Change = {szKey, nullptr, nullptr};

@@ -11,12 +11,38 @@
 // before a call returns success, unless the file system cannot sync a directory. Until it gets its
 // name it is .zamoc.tmp beside the file; one that a killed process leaves holds no keys, and goes
 // with the next change in its directory. Callers that change files of one directory, in any
-// process, take turns and wait up to ten seconds for theirs. Each thread keeps the text of the file
-// that it read last, to be asked for further keys. Why a file could not be read or changed goes to
-// syslog at LOG_ERR. Any thread may call any of these.
+// process, take turns and wait up to ten seconds for theirs. Why a file could not be read or
+// changed goes to syslog at LOG_ERR. Any thread may call any of these.
 #pragma once
 
 #include <cstddef>
+#include <string>
+
+// One reading of a capability file. While an object lives, ZAMOCFileGetKeyValue of the same path,
+// in the same thread, answers from it, whatever becomes of the file: all keys are of one moment. A
+// file that could not be read has no keys at all. Without an object every call reads the file.
+// Changes do so always. An object is an automatic variable of one thread.
+class ZAMOCReading {
+ public:
+  // Reads the file, and reports a failure.
+  explicit ZAMOCReading(const std::string& strFile);
+  ~ZAMOCReading();
+  ZAMOCReading(const ZAMOCReading&) = delete;
+  ZAMOCReading& operator=(const ZAMOCReading&) = delete;
+
+  // The calling thread's latest living object for that path, or null.
+  static const ZAMOCReading* Find(const char* szFile);
+
+  // As ZAMOCFileGetKeyValue below; no pointer is null and Size is not 0.
+  int GetKeyValue(const char* szKey, char* szValue, size_t Size) const;
+
+ private:
+  static thread_local const ZAMOCReading* m_pInnermost;
+  const std::string m_strFile;
+  const ZAMOCReading* const m_pOuter;
+  std::string m_strText;
+  bool m_blRead = false;
+};
 
 // Copies the value of szKey to szValue, a buffer of Size bytes; a longer value is cut, and the copy
 // is always terminated. Returns the value's whole length, 0 when the key is absent or its value

@@ -10,11 +10,16 @@
 #include <string>
 #include <vector>
 
+#include "fileops.h"
+
 struct DBConnect_tag {
   sqlite3* m_pDb = nullptr;
 
   // Finishes nothing: a transaction that is still open is rolled back.
-  ~DBConnect_tag() { sqlite3_close(m_pDb); }
+  ~DBConnect_tag() {
+    const fileops::NoCancel Guard;
+    sqlite3_close(m_pDb);
+  }
 };
 
 struct DBResult_tag {
@@ -37,7 +42,10 @@ constexpr int STATEMENT_JOURNAL_BYTES = 31 * 4096;
 constexpr const char* CACHE_SETTINGS = "PRAGMA cache_size = -128; PRAGMA cache_spill = -2000";
 
 struct StatementFinalizer {
-  void operator()(sqlite3_stmt* pStatement) const { sqlite3_finalize(pStatement); }
+  void operator()(sqlite3_stmt* pStatement) const {
+    const fileops::NoCancel Guard;  // it may end a transaction, and so write
+    sqlite3_finalize(pStatement);
+  }
 };
 using Statement = std::unique_ptr<sqlite3_stmt, StatementFinalizer>;
 

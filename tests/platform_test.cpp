@@ -1,5 +1,7 @@
 // The database layer, the executor on it, and the capability-file layer.
 
+#include <thread>
+
 #include "kidb.h"
 #include "rig.h"
 #include "utils.h"
@@ -65,13 +67,18 @@ string Get(const string& strFile) {
   return itos(Len) + " " + szValue;
 }
 
-// Also one of the same size at the same time, and one behind a read that was long after the last.
-TEST_F(CapabilityFile, ChangeByOthersIsSeenAndFailedReadReported) {
-  for (int Idx = 1000; Idx < 1300; ++Idx) {
-    WriteFile("/var/file", "k=" + itos(Idx));
-    usleep(Idx < 1290 ? 0 : 30000);
-    EXPECT_EQ(Get("/var/file") + Get("/var/file"), "4 " + itos(Idx) + "4 " + itos(Idx));
+TEST_F(CapabilityFile, ReadingIsOfOneMomentInItsThread) {
+  WriteFile("/var/file", "k=1");
+  {
+    const ZAMOCReading Reading("/var/file"), Missing("/var/none");
+    for (const char* szFile : {"/var/file", "/var/none"}) {
+      WriteFile(szFile, "k=22");
+    }
+    EXPECT_EQ(Get("/var/file") + Get("/var/none") + Get("/var/../var/file"), "1 1-1 2 22");
+    std::thread([] { EXPECT_EQ(Get("/var/file"), "2 22"); }).join();
+    EXPECT_EQ(ZAMOCFileRemoveKey("/var/none", "k"), 1);
   }
+  EXPECT_EQ(Get("/var/file") + Get("/var/none"), "2 220 ");
   SyslogSocket Syslog;
   EXPECT_EQ(Get("/proc/self/mem"), "-1 ");
   EXPECT_EQ(Syslog.Stop(), Lines{"<11> zamoc: [/proc/self/mem]: read failed with errno [5]"});
@@ -86,8 +93,7 @@ TEST_F(CapabilityFile, ReplacementIsWholeAndNotWithoutNeed) {
              "echo k=1 | tee .zamoc.tmp >file; chown 12:34 file; chmod 6741 file; "
              "ln file /var/old; ln -s $PWD/file /var/link; mkfifo fifo");
   const string strBefore = RunCommand(strCd);
-  EXPECT_EQ(Get(szNone) + Get(CAP_DIR + "/fifo") + Get(CAP_DIR + "/.zamoc.tmp"),
-            "-1 -1 -1 ");
+  EXPECT_EQ(Get(szNone) + Get(CAP_DIR + "/fifo") + Get(CAP_DIR + "/.zamoc.tmp"), "-1 -1 -1 ");
   EXPECT_EQ(ZAMOCFileSetKeyValue(szNone, "k", "2", szFormat), -1);
   EXPECT_EQ(ZAMOCFileRemoveKey(szNone, "k"), -1);
   for (const char* szBad : {"", " k", "#k", "k=", "k\n", "%s=\n", "%s=%s%s\n", "%s=%d\n",

@@ -105,6 +105,17 @@ TEST_F(Upgrade, CapabilityFilesChangeByTheirOwnKeys) {
             " continuous|ptz_speed_max = 1\n");
 }
 
+TEST_F(Upgrade, CapabilityFileThatCannotBeReadStaysAlone) {
+  for (const string strCall : {"%%stat", "openat", "read"}) {
+    const string strRun = "rm $C/*; echo pan=yes | tee $C/a $C/b >$C/c\n";
+    EXPECT_EQ(RunCommand(strRun + "ASAN_OPTIONS=detect_leaks=0 strace -fo trace -P $C/b -e " +
+                         "inject=" + strCall + ":error=EIO:when=1 $T --updateCap $C; echo $?;" +
+                         "cat $C/*; grep -c INJECTED trace"),
+              "0\npan= step\npan=yes\npan= step\n1\n")
+        << strCall;
+  }
+}
+
 // EINVAL says that the file system cannot sync directories.
 TEST_F(Upgrade, OnlyAFailedSyncOfTheDirectoryStopsTheWalk) {
   for (const auto& [strErrno, strEnd] :
