@@ -47,6 +47,7 @@ static void ReplaceBoolForSqlite(std::string& strCmd) {
 }
 
 static DBConnect* KiDBConnect(const std::string& strDBName) {
+  // ignored, but always passed
   return ZAMODBConnect(nullptr, "postgres", nullptr, strDBName.c_str());
 }
 

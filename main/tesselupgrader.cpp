@@ -1,6 +1,10 @@
 // Brings the recorder's camera rows and capability files in line with a newly installed Tessel
 // package: runs every migration action whose version threshold lies above the version number of the
 // package that was installed before.
+//
+// First what the actions share, then the actions on camera rows and those on capability files, each
+// kind in the order of its table, then the two tables, and last main() with what walks a table.
+// A new action goes to the end of its kind, and to its table by ascending threshold.
 
 #include <dirent.h>
 #include <malloc.h>
@@ -254,6 +258,7 @@ static int UpdateDAHUASD4XC212S() {
   return RunProfile(
       strConstraint,
       {
+          // both blanks belong here
           {"UPDATE camera SET rec_cbr_bitrate=2048, fps_2=10  ",
            " AND (resolution='1280x960' OR resolution='640x480') AND rec_bitrate_ctrl=2;"},
           {"UPDATE camera SET resolution='1280x720' ",
@@ -451,7 +456,7 @@ static int ForEachCapFile(int (*pUpgradeFile)(const std::string& strFilePath)) {
   if (gstrRemoteCapDir.empty()) {
     return -1;
   }
-  char szCapPath[512];
+  char szCapPath[512];  // deliberately cuts longer names
   snprintf(szCapPath, sizeof(szCapPath), "%s", gstrRemoteCapDir.c_str());
   const std::unique_ptr<DIR, DirCloser> pDir(opendir(szCapPath));
   if (pDir == nullptr) {
