@@ -64,17 +64,17 @@ static int RunSteps(std::initializer_list<const char*> Statements, int LineNo = 
   return 0;
 }
 
-struct PROFILE_CHANGE {
+struct ProfileChange {
   const char* szSet;        // "UPDATE camera SET ... ", ending in a blank
   const char* szCondition;  // " AND ...;", beginning with a blank
 };
 
 // Runs the changes, each narrowed by strConstraint, together as one transaction.
 static int RunProfile(const std::string& strConstraint,
-                      std::initializer_list<PROFILE_CHANGE> Changes, int LineNo = __builtin_LINE(),
+                      std::initializer_list<ProfileChange> Changes, int LineNo = __builtin_LINE(),
                       const char* szFunc = __builtin_FUNCTION()) {
   std::string strSqlCmd;
-  for (const PROFILE_CHANGE& Change : Changes) {
+  for (const ProfileChange& Change : Changes) {
     strSqlCmd += Change.szSet + strConstraint + Change.szCondition;
   }
   return RunSql(strSqlCmd, nullptr, LineNo, szFunc);

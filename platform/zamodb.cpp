@@ -96,11 +96,12 @@ int RunStatement(sqlite3_stmt* pStatement, std::unique_ptr<DBResult>* ppResult) 
       (*ppResult)->m_Columns.emplace_back(szName != nullptr ? szName : "");
     }
   }
-  int Step;
-  while ((Step = sqlite3_step(pStatement)) == SQLITE_ROW) {
+  int Step = sqlite3_step(pStatement);
+  while (Step == SQLITE_ROW) {
     if (Columns > 0 && !CopyRow(pStatement, ppResult->get())) {
       return SQLITE_NOMEM;
     }
+    Step = sqlite3_step(pStatement);
   }
   return Step == SQLITE_DONE ? SQLITE_OK : Step;
 }
