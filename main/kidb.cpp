@@ -35,9 +35,11 @@ static void ReplaceBoolForSqlite(std::string& strCmd) {
   bool blReplaced = false;
   for (const auto& [strWord, strDigit] : BoolStrMap) {
     // A digit never makes a new word, so the search can go on where it stands.
-    for (size_t Pos = 0; (Pos = strCmd.find(strWord, Pos)) != std::string::npos;) {
+    size_t Pos = strCmd.find(strWord);
+    while (Pos != std::string::npos) {
       strCmd.replace(Pos, strWord.size(), strDigit);
       blReplaced = true;
+      Pos = strCmd.find(strWord, Pos);
     }
   }
   if (blReplaced) {
