@@ -17,8 +17,8 @@
 
 namespace {
 
-using KEY_SET = std::set<std::string>;
-using KEY_VAL_MAP = std::map<std::string, std::string>;
+using KeySet = std::set<std::string>;
+using KeyValMap = std::map<std::string, std::string>;
 
 struct FileCloser {
   void operator()(FILE* pFile) const {
@@ -53,7 +53,7 @@ int ParseKeyVal(std::string_view Line, std::string_view& Key, std::string_view& 
 // Puts the pairs of szFile into KeyVals, unless their keys are there already, and puts the number
 // of their lines in Match, which is left alone when the file cannot be opened; with a pKeys, only
 // its keys count. Returns 0, or the errno of the open or of a read that failed.
-int ReadKeyVals(const char* szFile, const KEY_SET* pKeys, KEY_VAL_MAP& KeyVals, int& Match) {
+int ReadKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals, int& Match) {
   char rgBuf[4096];  // outlives the stream, which would else ask the system how large to make one
   const File pFile(fopen(szFile, "re"));
   if (pFile == nullptr) {
@@ -65,7 +65,11 @@ int ReadKeyVals(const char* szFile, const KEY_SET* pKeys, KEY_VAL_MAP& KeyVals, 
   std::string_view Key;
   std::string_view Val;
   std::string strKey;
-  for (ssize_t Len; (Len = getline(&Buffer.szLine, &Buffer.Size, pFile.get())) > 0;) {
+  for (;;) {
+    const ssize_t Len = getline(&Buffer.szLine, &Buffer.Size, pFile.get());
+    if (Len <= 0) {
+      break;
+    }
     std::string_view Line(Buffer.szLine, static_cast<size_t>(Len));
     if (Line.back() == '\n') {
       Line.remove_suffix(1);
@@ -86,7 +90,7 @@ int ReadKeyVals(const char* szFile, const KEY_SET* pKeys, KEY_VAL_MAP& KeyVals, 
 }
 
 // Adds to KeyVals what it does not hold yet.
-int GetKeyVals(const char* szFile, const KEY_SET* pKeys, KEY_VAL_MAP& KeyVals) {
+int GetKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals) {
   KiFlock Lock(szFile);
   if (Lock.LockSh(-1) != 0) {
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to lock file [%s] with errno [%d]\n", szFile,
@@ -120,7 +124,7 @@ int WriteText(const char* szFile, const std::string& strText) {
   return Fd.Close();
 }
 
-int WriteToFile(const char* szFile, const KEY_VAL_MAP& KeyVals, bool blQuoteVal) {
+int WriteToFile(const char* szFile, const KeyValMap& KeyVals, bool blQuoteVal) {
   if (szFile == nullptr || *szFile == '\0') {
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "File not specified.\n");
     return -1;
@@ -139,7 +143,7 @@ int WriteToFile(const char* szFile, const KEY_VAL_MAP& KeyVals, bool blQuoteVal)
   return 0;
 }
 
-int WriteToFileAtomic(const char* szFile, const KEY_VAL_MAP& KeyVals, bool blQuoteVal) {
+int WriteToFileAtomic(const char* szFile, const KeyValMap& KeyVals, bool blQuoteVal) {
   fileops::TmpFile Tmp(CreateTmpFile(szFile));
   if (WriteToFile(Tmp.Name(), KeyVals, blQuoteVal) != 0) {
     return -1;
@@ -179,7 +183,7 @@ int LockCurrent(KiFlock& Lock) {
   return -1;
 }
 
-int UpdateKeyVals(const char* szFile, const KEY_VAL_MAP& AddKeyVals, const KEY_SET& DelKeys,
+int UpdateKeyVals(const char* szFile, const KeyValMap& AddKeyVals, const KeySet& DelKeys,
                   bool blQuoteVal) {
   if (AddKeyVals.empty() && DelKeys.empty()) {
     return 0;
@@ -191,7 +195,7 @@ int UpdateKeyVals(const char* szFile, const KEY_VAL_MAP& AddKeyVals, const KEY_S
              errno);
     return -1;
   }
-  KEY_VAL_MAP KeyVals;
+  KeyValMap KeyVals;
   int Match = 0;
   const int Errno = ReadKeyVals(szFile, nullptr, KeyVals, Match);
   if (Errno != 0) {
@@ -224,8 +228,8 @@ int KiFileGetKeyVals(const char* szFile, const std::set<std::string>& Keys,
 
 int KiFileGetVal(const char* szFile, const char* szKey, std::string& strVal) {
   const std::string strKey = szKey;
-  const KEY_SET Keys = {strKey};
-  KEY_VAL_MAP KeyVals;
+  const KeySet Keys = {strKey};
+  KeyValMap KeyVals;
   const int Ret = GetKeyVals(szFile, &Keys, KeyVals);
   strVal = KeyVals[strKey];
   return Ret;

@@ -112,14 +112,14 @@ int OpenLog(LOG_TYPE LogType) {
 
 constexpr char PREFIX_FORMAT[] = "%s %s%s %s:%d:%s(): ";
 
-struct PREFIX {
+struct LinePrefix {
   char szTime[FIELD_SIZE] = "";
   char szPidTid[FIELD_SIZE];
   char szCategLevel[FIELD_SIZE] = "";
 };
 
 // To be called under the lock, so that the lines of a file stand in the order of their times.
-void FillPrefix(PREFIX* pPrefix, const char* szCateg, const char* szLevel) {
+void FillPrefix(LinePrefix* pPrefix, const char* szCateg, const char* szLevel) {
   const pid_t Pid = getpid();
   const pid_t Tid = gettid();
   KiGetPresentTime(pPrefix->szTime);
@@ -146,7 +146,7 @@ __attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const cha
     return;
   }
   szFile += BaseNameOffset(szFile);
-  PREFIX Prefix;
+  LinePrefix Prefix;
   FillPrefix(&Prefix, szCateg, szLevel);
   char szLine[LINE_SIZE];
   auto Len =

@@ -115,9 +115,11 @@ void ReplaceSubstr(std::string& strInput, const std::string& strSub,
   }
   std::string strOutput;
   size_t Done = 0;
-  for (size_t Pos; (Pos = strInput.find(strSub, Done)) != std::string::npos;) {
+  size_t Pos = strInput.find(strSub);
+  while (Pos != std::string::npos) {
     strOutput.append(strInput, Done, Pos - Done).append(strReplace);
     Done = Pos + strSub.size();
+    Pos = strInput.find(strSub, Done);
   }
   strOutput.append(strInput, Done, std::string::npos);
   strInput = std::move(strOutput);
