@@ -1,0 +1,97 @@
+"""The library in programs of the package: from start to end, in failing calls, side by side."""
+
+import os
+import re
+import subprocess
+import time
+
+import pytest
+from conftest import SOURCE
+
+
+def log_lines(log_file):
+    """Returns the lines of a log, without time, process and line number."""
+    lines = log_file.read_text().splitlines()
+    return [re.sub(r"^.{15} \[\d+\]|(?<=\.cpp):\d+", "", line) for line in lines]
+
+
+def test_configuration_is_attached_from_start_to_end(appliance):
+    script = '"$@" create; "$@" log 52 3; "$@" log 52 4'
+    ended = appliance.inside("sh", "-c", script, "sh", *appliance.command("client"))
+    # Before main, in it, after it, and at the very end of each process.
+    assert ended.stdout == "0000" + "0110" + "0110"
+    # Behind what "create" says of settings that are not there.
+    assert log_lines(appliance.log_file)[1:] == ["[event][notice] client.cpp:main(): x"]
+
+
+FAILURES = [
+    # What the client does, the call that fails, and the function and line that log it.
+    ("get", "flock:error=ENOLCK:when=1", "GetKeyVals", "lock file [F] with errno [37]"),
+    ("get", "openat:error=EACCES:when=2", "GetKeyVals", "open file [F] with errno [13]"),
+    ("set", "flock:error=ENOLCK:when=1", "UpdateKeyVals", "lock file [F] with errno [37]"),
+    ("set", "openat:error=EACCES:when=2", "UpdateKeyVals", "open file [F] with errno [13]"),
+    ("set", "read:error=EIO:when=2", "UpdateKeyVals", "open file [F] with errno [5]"),
+    ("set", "write:error=ENOSPC:when=1", "WriteToFile", "wrtie file [F.tmp] with errno [28]."),
+    ("set", "/chown:error=EPERM", "WriteToFileAtomic", "chown [F.tmp] with errno [1]"),
+    ("set", "/chmod:error=EPERM", "WriteToFileAtomic", "chmod [F.tmp] with errno [1]"),
+    (
+        "set",
+        "/rename:error=EBUSY",
+        "WriteToFileAtomic",
+        "rename file [F.tmp] to [F] with errno [16]",
+    ),
+]
+
+
+@pytest.mark.parametrize("action, failure, function, message", FAILURES)
+def test_failing_step_is_logged_and_leaves_the_file(appliance, action, failure, function, message):
+    file = appliance.directory / "files/f"
+    file.parent.mkdir()
+    file.write_text("a=1\n" + "x" * 8000)
+    strace = ["strace", "-f", "-o", "/dev/null", "-e", f"inject={failure}"]
+    if "when" in failure and "write" not in failure:
+        strace += ["-P", file]
+    ended = appliance.inside(*strace, *appliance.command("client", action, file, "b", "2"))
+    line = log_lines(appliance.log_file)[0].replace(str(file), "F")
+    line = re.sub(r"\.tmp\.\w{6}", ".tmp", line)
+    assert line == f"[utils][error] fileutils.cpp:{function}(): Failed to {message}"
+    assert ended.returncode == 1
+    assert file.read_text() == "a=1\n" + "x" * 8000
+    assert os.listdir(file.parent) == ["f"]
+
+
+def test_temporary_file_that_cannot_be_made_is_logged(appliance):
+    file = appliance.directory / ("f" * 250)  # too long for a name with six characters more
+    ended = appliance.inside(*appliance.command("client", "set", file, "b", "2"))
+    assert ended.returncode == 1
+    assert log_lines(appliance.log_file) == [
+        "[utils][error] fileutils.cpp:CreateTmpFile(): Failed to create tmp file with errno [36]",
+        "[utils][error] fileutils.cpp:WriteToFile(): File not specified.",
+    ]
+
+
+def test_lines_stay_whole_and_in_order_while_the_log_is_rotated(appliance):
+    client = appliance.command("client", "write", 250)
+    command = [SOURCE / "tools/private-appliance", appliance.directory, *client]
+    writers = [subprocess.Popen(command, stdout=subprocess.DEVNULL) for _ in range(8)]
+    logs = []
+    for rotation in range(10):
+        while not appliance.log_file.exists():
+            time.sleep(0.001)
+        logs.append(appliance.log_file.rename(f"{appliance.log_file}.{rotation}"))
+        time.sleep(0.02)
+    writers[0].kill()
+    assert [writer.wait() for writer in writers[1:]] == [0] * 7
+    next_number = {}
+    for log in [*logs, appliance.log_file]:
+        last_time = ""
+        for line in log.read_text().splitlines():
+            match = re.fullmatch(r"(.{15}) (\[[][\d]+\]) ?f:1:Fn\(\): (\d+) (0+)", line)
+            assert match, f"not a whole line in {log.name}: {line}"
+            when, writer, number, zeros = match.groups()
+            assert int(number) == len(zeros), f"not a whole line in {log.name}: {line}"
+            assert int(number) == next_number.get(writer, 1), f"out of order in {log.name}: {line}"
+            assert when >= last_time, f"earlier than the line before it in {log.name}: {line}"
+            next_number[writer] = int(number) + 1
+            last_time = when
+    assert list(next_number.values()).count(251) >= 14

@@ -1,0 +1,55 @@
+// A program of the package. Prints whether the shared configuration is attached while its global
+// object is constructed, in main, while the object is destroyed, and at the very end.
+
+#include <fileutils.h>
+#include <kidebuglog.h>
+#include <sys/shm.h>
+
+#include <cstdio>
+#include <string>
+#include <thread>
+
+static void PrintAttached() { printf("%d", g_pDbgLogCfg != nullptr); }
+
+static struct Global {
+  Global() { PrintAttached(); }
+  ~Global() { PrintAttached(); }
+} gGlobal;
+
+__attribute__((destructor(101))) static void AtTheVeryEnd() {
+  PrintAttached();
+  fflush(stdout);
+}
+
+// "line number, as many zeros as it says"
+static void WriteLines(int Count) {
+  for (int Line = 1; Line <= Count; ++Line) {
+    KiPrintf(KI_LOG, nullptr, nullptr, "f", 1, "Fn", "%d %0*d\n", Line, Line, 0);
+  }
+}
+
+// create | log CATEG LEVEL | write LINES | get FILE KEY | set FILE KEY VALUE
+int main(int /*argc*/, char** argv) {
+  const std::string strCommand = argv[1];
+  PrintAttached();
+  if (strCommand == "create") {
+    const int Id = shmget(KiShmDbgLogIPCKey(), sizeof(KiDbgLogCfg), IPC_CREAT | 0666);
+    KiShmDbgLogCfgAt()->Init(KiShmDbgLogIPCKey());
+    return Id == -1;
+  }
+  if (strCommand == "log") {
+    const auto Categ = static_cast<LOG_CATEG>(std::stoi(argv[2]));
+    KIDBGLOG(Categ, static_cast<LOG_LEVEL>(std::stoi(argv[3])), "x\n");
+    return 0;
+  }
+  if (strCommand == "write") {
+    const int Count = std::stoi(argv[2]);
+    std::thread Other(WriteLines, Count);
+    WriteLines(Count);
+    Other.join();
+    return 0;
+  }
+  std::string strVal;
+  return strCommand == "get" ? KiFileGetVal(argv[2], argv[3], strVal) < 0
+                             : KiFileSetVal(argv[2], argv[3], argv[4], true) != 0;
+}
