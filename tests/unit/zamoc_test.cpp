@@ -16,6 +16,7 @@ namespace {
 using namespace std::string_literals;
 
 constexpr const char* FILE_NAME = "/var/services/camveld/file";
+constexpr const char* LEFT_BEHIND = "/var/services/camveld/.zamoc.tmp";
 
 class CapabilityFile : public PrivateVar {};
 
@@ -83,11 +84,20 @@ TEST_F(CapabilityFile, WhatIsNotOneLineOfTheKeyIsRefused) {
   EXPECT_EQ(ReadFile(FILE_NAME), "k=1\n");
 }
 
-TEST_F(CapabilityFile, ChangeByOthersIsSeen) {
-  for (int Idx = 1000; Idx < 1300; ++Idx) {  // mostly with the size and time from before
-    WriteFile(FILE_NAME, "k=" + std::to_string(Idx));
-    ASSERT_EQ(Get(FILE_NAME), "4 " + std::to_string(Idx));
+TEST_F(CapabilityFile, ReadingIsOfOneMomentInItsThread) {
+  WriteFile(FILE_NAME, "k=1");
+  {
+    const ZAMOCReading Reading(FILE_NAME);
+    const ZAMOCReading Missing("/var/none");
+    WriteFile(FILE_NAME, "k=22");
+    WriteFile("/var/none", "k=22");
+    EXPECT_EQ(Get(FILE_NAME), "1 1");
+    EXPECT_EQ(Get("/var/none"), "-1 ");
+    EXPECT_EQ(Get("/var/../var/none"), "2 22");
+    EXPECT_EQ(std::async(std::launch::async, Get, FILE_NAME).get(), "2 22");
+    EXPECT_EQ(ZAMOCFileRemoveKey("/var/none", "k"), 1);
   }
+  EXPECT_EQ(Get(FILE_NAME), "2 22");
 }
 
 TEST_F(CapabilityFile, OnlyRegularFilesAreRead) {
@@ -108,6 +118,8 @@ TEST_F(CapabilityFile, ReplacementIsWholeAndNotWithoutNeed) {
   struct stat Before;
   struct stat After;
   WriteFile(FILE_NAME, "k=1\n");
+  WriteFile(LEFT_BEHIND, "k=1\n");  // by a killed process
+  EXPECT_EQ(Get(LEFT_BEHIND), "-1 ");
   static_cast<void>(!chown(FILE_NAME, 12, 34));  // an ordinary user may not
   chmod(FILE_NAME, 06741);
   fs::create_hard_link(FILE_NAME, szOld);

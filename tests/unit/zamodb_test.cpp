@@ -3,7 +3,6 @@
 #include "zamodb.h"
 
 #include <sys/resource.h>
-#include <sys/stat.h>
 
 #include "kidb.h"
 #include "rig.h"
@@ -28,15 +27,6 @@ std::string TakeRows(DBResult* pResult) {
   }
   ZAMODBFreeResult(pResult);
   return strRows;
-}
-
-TEST_F(Database, OnlyExistingFilesAreOpened) {
-  mkfifo("/var/fifo", 0600);
-  for (const char* szName : {"", "/var/none", "/var", "/var/fifo", ":memory:"}) {
-    EXPECT_EQ(ZAMODBConnect("host", "user", "password", szName), nullptr) << szName;
-  }
-  EXPECT_EQ(ZAMODBConnect(nullptr, nullptr, nullptr, nullptr), nullptr);
-  EXPECT_FALSE(fs::exists("/var/none"));
 }
 
 TEST_F(Database, TextsRunToTheirFirstFailure) {
