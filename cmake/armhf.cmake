@@ -13,4 +13,5 @@ set(CMAKE_FIND_ROOT_PATH_MODE_INCLUDE ONLY)
 # CMake packages may also lie where a build of this project was installed.
 set(CMAKE_FIND_ROOT_PATH_MODE_PACKAGE BOTH)
 
-set(CMAKE_CROSSCOMPILING_EMULATOR ${TESSEL_ROOT}/tools/run-armhf)
+# In the cache, where the tests of programs find it.
+set(CMAKE_CROSSCOMPILING_EMULATOR ${TESSEL_ROOT}/tools/run-armhf CACHE FILEPATH "")
