@@ -36,6 +36,7 @@ SYSLOG_PREFIX = re.compile(r"^<\d+>.{15} [^:]*: ?")
 
 def pytest_addoption(parser):
     parser.addoption("--build", default="build/dev", help="the build tree of the tested programs")
+    parser.addoption("--accept", action="store_true", help="write tests/expected/ anew")
 
 
 @dataclass
@@ -148,6 +149,7 @@ class Appliance:
         database = sqlite3.connect(self.database, timeout=30, isolation_level=None)
         database.text_factory = lambda text: text.decode(errors="surrogateescape")
         with closing(database):
+            database.execute("PRAGMA synchronous = off")
             if ";" in text and not parameters:
                 database.executescript(text)
                 return []
