@@ -15,7 +15,7 @@ import sqlite3
 import subprocess
 import tempfile
 import threading
-from contextlib import closing
+from contextlib import closing, contextmanager
 from dataclasses import dataclass
 from pathlib import Path
 
@@ -28,6 +28,8 @@ PROGRAMS = {
     "kidbglog": "tools/kidbglog",
     "client": "tests/unit/client",
 }
+# Where a capability file is written anew before it gets its name.
+TEMPORARY_FILE = re.search(r"\.\w+\.tmp", (SOURCE / "platform/zamoc.h").read_text())[0]
 # Nov 24 10:00:00 [4711] tesselupgrader.cpp:123:
 LOG_PREFIX = re.compile(r"^\w{3} [ \d]\d [\d:.]+ \[\d+\](?:\[\d+\])? ?((?:\[.*?\] )?[^:]*:)\d+:")
 # <11>Nov 24 10:00:00 tesselupgrader:
@@ -206,6 +208,8 @@ class Appliance:
     def rows(self):
         """Returns the columns of every row, by its table and key; none if they cannot be read."""
         rows = {}
+        if not self.database.exists():
+            return rows
         try:
             for _, table, kind, _, without_rowid, _ in self.sql("PRAGMA main.table_list"):
                 if kind == "table" and not table.startswith("sqlite_"):
@@ -241,17 +245,27 @@ def unified_diffs(before, after):
     return text
 
 
+@contextmanager
+def new_appliance(config):
+    build = (SOURCE / config.getoption("build")).resolve()
+    with tempfile.TemporaryDirectory(prefix="tessel-", dir="/tmp") as directory:
+        yield Appliance(Path(directory), build)
+
+
+def load_example(appliance):
+    appliance.sql((SOURCE / "examples/appliance.sql").read_text())
+    shutil.copytree(SOURCE / "examples/KICapInfo", appliance.caps, dirs_exist_ok=True)
+
+
 @pytest.fixture
 def appliance(request):
     """An appliance with its directories and nothing in them."""
-    build = (SOURCE / request.config.getoption("build")).resolve()
-    with tempfile.TemporaryDirectory(prefix="tessel-", dir="/tmp") as directory:
-        yield Appliance(Path(directory), build)
+    with new_appliance(request.config) as appliance:
+        yield appliance
 
 
 @pytest.fixture
 def example(appliance):
     """The appliance of examples/: many old cameras and some capability files."""
-    appliance.sql((SOURCE / "examples/appliance.sql").read_text())
-    shutil.copytree(SOURCE / "examples/KICapInfo", appliance.caps, dirs_exist_ok=True)
+    load_example(appliance)
     return appliance

@@ -11,11 +11,11 @@ from dataclasses import dataclass
 from pathlib import Path
 
 import pytest
-from conftest import SOURCE, row_changes
+from conftest import SOURCE, load_example, new_appliance, row_changes
 
 EXPECTED = SOURCE / "tests/expected"
-# The lists below are made once in each process that runs tests.
-pytestmark = pytest.mark.xdist_group("migrations")
+# Tests that need the list of actions share a process, since it takes seconds to make.
+with_actions = pytest.mark.xdist_group("actions")
 
 
 @dataclass
@@ -75,37 +75,39 @@ def accepts(request):
     return compare
 
 
-found = {}
-
-
-@pytest.fixture
-def selected(example):
-    """The names of the database actions that run, by version."""
-    if not found:
-        thresholds = sorted({threshold for threshold, _ in table_rows() if threshold > 0})
+@pytest.fixture(scope="module")
+def listed(request):
+    """Which database actions run for which version, and all transactions of each."""
+    thresholds = sorted({threshold for threshold, _ in table_rows() if threshold > 0})
+    program = Path(__file__).with_name("transactions.py")
+    with new_appliance(request.config) as appliance:
+        load_example(appliance)
+        command = appliance.command("tesselupgrader")
         text = ",".join(map(str, thresholds))
-        program = Path(__file__).with_name("transactions.py")
-        database = example.database.read_bytes()
-        ended = example.inside(sys.executable, program, text, *example.command("tesselupgrader"))
-        assert ended.returncode == 0, ended.stdout
-        found.update(json.loads(ended.stdout.splitlines()[-1]))
-        example.database.write_bytes(database)
-        example.log_file.unlink()
-    return {int(version): names for version, names in found["selected"].items()}
+        ended = appliance.inside(sys.executable, program, text, *command)
+    assert ended.returncode == 0, ended.stdout
+    return json.loads(ended.stdout.splitlines()[-1])
 
 
 @pytest.fixture
-def actions(selected):
+def selected(listed):
+    """The names of the database actions that run, by version."""
+    return {int(version): names for version, names in listed["selected"].items()}
+
+
+@pytest.fixture
+def actions(listed, selected):
     """The database actions, in the order in which they run."""
     actions = []
     for name in selected[0]:
-        texts = [text for action, text in found["transactions"] if action == name]
+        texts = [text for action, text in listed["transactions"] if action == name]
         above = [version + 1 for version, names in selected.items() if name in names]
         threshold = 0 if name in selected[max(selected)] else max(above)
         actions.append(Action(threshold, name, texts))
     return actions
 
 
+@with_actions
 def test_every_action_has_its_threshold_and_texts(actions, selected, accepts):
     lines = ["# Threshold and name of each database action; * begins a transaction."]
     for action in actions:
@@ -119,6 +121,7 @@ def test_every_action_has_its_threshold_and_texts(actions, selected, accepts):
         assert names == above, f"an upgrade from {version} selects other actions"
 
 
+@with_actions
 def test_every_statement_finds_a_camera_in_the_example(actions, example):
     idle = []
     with sqlite3.connect(example.database) as database:
@@ -186,6 +189,7 @@ def last_changes(actions, example):
     return cells
 
 
+@with_actions
 def test_a_failure_at_the_last_statement_leaves_this(actions, example, accepts):
     start = example.database.read_bytes()
     expected = upgraded(example).changes
@@ -205,6 +209,7 @@ def test_a_failure_at_the_last_statement_leaves_this(actions, example, accepts):
     accepts("failures.txt", "what a failure in the middle leaves differs", lines)
 
 
+@with_actions
 def test_every_capability_action_changes_a_file(selected, example, accepts):
     example.database.unlink()
     start = example.capability_texts()

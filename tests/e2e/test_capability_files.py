@@ -1,0 +1,64 @@
+import os
+import stat
+
+import pytest
+from conftest import TEMPORARY_FILE
+
+CAPS = "/var/packages/Camveld/target/@camveld/@KICapInfo"
+KEYS = [
+    # version (ALL: every action), file before, file after
+    (80, "pan=yes\ntilt=continuous\n", "pan=yes\ntilt=continuous\n"),
+    (68, "pan=yes\ntilt=continuous\n", "pan=yes\ntilt=continuous\nptz_speed_max = 1\n"),
+    (67, "pan=yes\ntilt=continuous\n", "pan= step\ntilt=continuous\nptz_speed_max = 1\n"),
+    (0, "ptz_continuous_move=yes\npan=yes\n", "pan= continuous\nptz_speed_max = 1\n"),
+    (0, 'zoom="yes"\r\nptz_continuous_move = "yes"\r\n', "zoom= continuous\n"),
+    (0, "ptz_continuous_move=Yes\npan=YES\n", "ptz_continuous_move=Yes\npan=YES\n"),
+    (0, "tilt=yes\nzoom=yes", "tilt= step\nzoom= step\n"),
+    (0, "pan=continuous\nptz_speed_max=7\n", "pan=continuous\nptz_speed_max=7\n"),
+    (0, "ptz_speed_max=\npan=continuous\n", "ptz_speed_max = 1\npan=continuous\n"),
+]
+
+
+@pytest.mark.parametrize("version, before, after", KEYS)
+def test_keys_change(appliance, version, before, after):
+    file = appliance.capability_file("camera", before)
+    appliance.upgrade(version)
+    assert file.read_bytes().decode() == after
+
+
+@pytest.mark.parametrize("marker, status", [("", 0), ("ptz_continuous_move=yes\n", 255)])
+def test_only_the_removal_of_the_marker_has_to_succeed(appliance, marker, status):
+    (appliance.caps / TEMPORARY_FILE).mkdir()
+    file = appliance.capability_file("camera", "pan=yes\n" + marker)
+    assert appliance.run("--updateCap", CAPS).status == status
+    assert file.read_text() == "pan=yes\n" + marker
+
+
+def test_a_directory_of_strange_files(appliance):
+    # As many bytes as are used of the argument: what follows them is cut off.
+    parent = appliance.directory / "d" / ("e" * 240)
+    caps = parent / ("f" * (511 - len(f"/var/packages/Camveld/target/d/{'e' * 240}/")))
+    caps.mkdir(parents=True)
+    (appliance.directory / "outside").write_text("pan=yes\n")
+    names = ["a", "new\nline", "x" * 255, ".hidden"]
+    for name in names:
+        (caps / name).write_text("pan=yes\n")
+    (caps / "a").chmod(0o400)
+    binary = bytes(range(11, 256)) * 400 + b"\n"
+    (caps / "binary").write_bytes(binary + b"ptz_continuous_move=yes\npan=yes\n")
+    (caps / "directory").mkdir()
+    os.mkfifo(caps / "fifo")
+    links = {"link": "../../../outside", "device": "/dev/zero", "loop": "loop", "dangling": "none"}
+    for name, target in links.items():
+        (caps / name).symlink_to(target)
+    os.mknod(caps / "socket", 0o600 | stat.S_IFSOCK)
+    entries = sorted(os.listdir(caps))
+
+    argument = f"/var/packages/Camveld/target/d/{'e' * 240}/{caps.name}behind"
+    assert appliance.run("--updateCap", argument).status == 0
+    assert [(caps / name).read_text() for name in names] == ["pan= step\n"] * len(names)
+    assert (caps / "a").stat().st_mode & 0o777 == 0o400
+    assert (caps / "binary").read_bytes() == binary + b"pan= continuous\nptz_speed_max = 1\n"
+    assert {name: os.readlink(caps / name) for name in links} == links
+    assert (appliance.directory / "outside").read_text() == "pan= step\n"
+    assert sorted(os.listdir(caps)) == entries

@@ -1,0 +1,56 @@
+import re
+import shutil
+
+import pytest
+
+PACKAGE = "/var/packages/Camveld/target/@camveld"
+USAGE = (
+    r"tesselupgrader [\d.]+\nUsage:\n"
+    r"tesselupgrader \{pre-upgrade-version\}\|\{--updateCap remote-cap-dir\}\n"
+)
+
+
+@pytest.mark.parametrize("arguments", ["", "1 2", "1 2 3", "--updatecap /tmp", "--updateCap / 3"])
+def test_other_arguments_print_the_usage_and_do_nothing(example, arguments):
+    result = example.run(*arguments.split())
+    assert result.status == 1
+    assert re.fullmatch(USAGE, result.output)
+    assert (result.changes, result.diffs, result.log) == ([], "", [])
+
+
+NUMBERS = [
+    ("-1", 4294967295),
+    (" +99999x", 99999),
+    ("99999999999", 2147483647),
+    ("-99999999999999999999", 2147483648),
+]
+
+
+@pytest.mark.parametrize("argument, number", NUMBERS)
+def test_a_version_counts_as_far_as_it_is_a_number(example, argument, number):
+    result = example.run(argument)
+    assert result.status == 0
+    assert result.log == [f"tesselupgrader.cpp:main(): TESSEL pre-upgrade version: {number}"]
+    assert (result.changes, result.diffs) == ([], "")
+
+
+def test_a_single_argument_is_a_version_whatever_it_is(example):
+    result = example.run("--updateCap")
+    assert result.log[0].endswith("version: 0")
+    assert result.changes
+
+
+def test_a_missing_capability_directory_holds_nothing_to_do(example):
+    shutil.rmtree(example.caps)
+    ended = example.inside(
+        "sh", "-c", 'rm -r $0/*; "$@"', PACKAGE, *example.command("tesselupgrader", 0)
+    )
+    assert ended.returncode == 0
+
+
+@pytest.mark.parametrize("replace", ["rm -r $0", "rm -r $0; touch $0"])
+@pytest.mark.parametrize("arguments", [[79], ["--updateCap", ""]])
+def test_a_missing_package_directory_is_an_error(example, replace, arguments):
+    program = example.command("tesselupgrader", *arguments)
+    ended = example.inside("sh", "-c", f'{replace}; "$@"', PACKAGE, *program)
+    assert (ended.returncode, ended.stdout) == (255, "")
