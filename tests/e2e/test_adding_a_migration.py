@@ -8,7 +8,7 @@ import pytest
 from conftest import SOURCE
 
 PAGE = SOURCE / "docs/adding-a-migration.md"
-STEP = re.compile(r"^Insert into `(.+?)`, (.+):\n\n```\w*\n(.*?)```", re.M | re.S)
+STEP = re.compile(r"^Insert into `([^`]+)`, ([^\n]+):\n\n```\w*\n(.*?)```", re.M | re.S)
 TESTS = ["/usr/bin/python3", "-m", "pytest", "-q", "-p", "no:cacheprovider", "-n", "2"]
 
 

@@ -62,3 +62,24 @@ def test_a_directory_of_strange_files(appliance):
     assert {name: os.readlink(caps / name) for name in links} == links
     assert (appliance.directory / "outside").read_text() == "pan= step\n"
     assert sorted(os.listdir(caps)) == entries
+
+
+@pytest.mark.parametrize("call", ["%%stat", "openat", "read"])
+def test_a_file_that_cannot_be_read_stays_and_the_others_change(appliance, call):
+    files = [appliance.capability_file(name, "pan=yes\n") for name in "abc"]
+    trace = appliance.directory / "trace"
+    inject = f"inject={call}:error=EIO:when=1"
+    strace = ["strace", "-f", "-o", trace, "-P", f"{CAPS}/b", "-e", inject]
+    assert appliance.run("--updateCap", CAPS, under=strace).status == 0
+    assert [file.read_text() for file in files] == ["pan= step\n", "pan=yes\n", "pan= step\n"]
+    assert trace.read_text().count("INJECTED") == 1
+
+
+# EINVAL says that the file system cannot sync directories.
+@pytest.mark.parametrize("error, status", [("EINVAL", 0), ("EIO", 255)])
+def test_only_a_failed_sync_of_the_directory_stops_the_walk(appliance, error, status):
+    files = [appliance.capability_file(name, "ptz_continuous_move=yes\n") for name in "ab"]
+    strace = ["strace", "-f", "-o", "/dev/null", "-P", CAPS, "-e", f"inject=fsync:error={error}"]
+    assert appliance.run("--updateCap", CAPS, under=strace).status == status
+    emptied = [file for file in files if file.read_text() == ""]
+    assert len(emptied) == (2 if status == 0 else 1)
