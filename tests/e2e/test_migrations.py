@@ -50,10 +50,10 @@ def table_rows():
 
 
 def complain(title, lines):
-    """Fails with a title and as many lines as fit on a screen."""
-    if len(lines) > 25:
-        lines = [*lines[:24], f"and {len(lines) - 24} lines more"]
-    pytest.fail("\n".join([title, *(line[:300] for line in lines)]), pytrace=False)
+    """Fails with a title and few enough lines for a screen with several failures."""
+    if len(lines) > 8:
+        lines = [*lines[:7], f"and {len(lines) - 7} lines more"]
+    pytest.fail("\n".join([title, *(line[:200] for line in lines)]), pytrace=False)
 
 
 @pytest.fixture
