@@ -96,11 +96,11 @@ TEST_F(Utils, TimerCountsFromThePlannedTickUnlessItIsPast) {
 
 TEST_F(Utils, TimerDoesNotWaitForAClockThatWasSetBack) {
   static DelayTimer gTimer(400000);
-  static int64_t gmsecWithin = -1;
-  signal(SIGALRM, [](int) { gmsecWithin = Tick(&gTimer); });  // its last tick is yet to come
+  static int64_t gWithin = -1;
+  signal(SIGALRM, [](int) { gWithin = Tick(&gTimer); });  // its last tick is yet to come
   ualarm(10000, 0);
   EXPECT_GE(Tick(&gTimer), 390);
-  EXPECT_LT(gmsecWithin, 200);
+  EXPECT_LT(gWithin, 200);
 }
 
 TEST_F(Utils, WriteFdGoesOnAfterSignalsAndFullPipes) {
