@@ -1,0 +1,19 @@
+// The command line.
+#pragma once
+
+#include <string>
+
+enum class MODE { TEXT, SUMMARY, JSON, LIST, CHECK };
+
+struct OPTIONS {
+  MODE Mode = MODE::TEXT;
+  std::string strDatabase;
+  std::string strCaps;     // empty: the capability files are not looked at
+  std::string strTool;     // empty: to be looked for
+  std::string strUndoDir;  // empty: no way back is written
+  std::string strVersion;
+  bool blDone = false;  // --help or --version: everything is printed
+};
+
+// Reads the command line. Throws Failure.
+OPTIONS ParseOptions(int argc, char* argv[]);

@@ -1,0 +1,212 @@
+#include "tool.h"
+
+#include <sys/inotify.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <climits>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+#include "command.h"
+#include "failure.h"
+#include "files.h"
+
+namespace {
+
+constexpr int FAILED_STATUS = 255;
+
+std::string FirstLine(const std::string& strText) { return strText.substr(0, strText.find('\n')); }
+
+// --- Where the programs are ---
+
+std::string OwnDirectory() { return std::filesystem::read_symlink("/proc/self/exe").parent_path(); }
+
+// Installed it is in libexec; a build tree is build/PRESET of the source tree.
+std::string FindHelper(const std::string& strOwnDir) {
+  for (const char* szPlace : {"/../libexec/tesselupgrader/", "/../../../tools/"}) {
+    const std::string strHelper = strOwnDir + szPlace + "private-appliance";
+    if (Exists(strHelper)) {
+      return strHelper;
+    }
+  }
+  throw Failure("private-appliance is not installed in " + strOwnDir +
+                "/../libexec/tesselupgrader");
+}
+
+// The first bytes of a program, which say what processor it is for; a script has none.
+std::string Processor(const std::string& strProgram) {
+  char rgHead[20] = "";
+  std::ifstream(strProgram, std::ios::binary).read(rgHead, sizeof(rgHead));
+  const std::string strHead(rgHead, sizeof(rgHead));
+  return strHead.compare(0, 4, "\177ELF") == 0 ? strHead.substr(4, 1) + strHead.substr(18) : "";
+}
+
+bool IsRunnable(const std::string& strTool) {
+  const std::string strProcessor = Processor(strTool);
+  return access(strTool.c_str(), X_OK) == 0 && !IsDirectory(strTool) &&
+         (strProcessor.empty() || strProcessor == Processor("/proc/self/exe"));
+}
+
+std::string FindTool(const std::string& strOwnDir) {
+  std::vector<std::string> Tools = {strOwnDir + "/tesselupgrader"};
+  if (Exists(strOwnDir + "/../../../tools/private-appliance")) {
+    const std::string strBuild = strOwnDir + "/../../";
+    for (const std::string& strTree : ListDirectory(strBuild)) {
+      Tools.push_back(strBuild + strTree + "/main/tesselupgrader");
+    }
+  }
+  std::string strNewest;
+  std::filesystem::file_time_type Newest;
+  for (const std::string& strTool : Tools) {
+    if (IsRunnable(strTool)) {
+      const auto Time = std::filesystem::last_write_time(strTool);
+      if (strNewest.empty() || Time > Newest) {
+        strNewest = strTool;
+        Newest = Time;
+      }
+    }
+  }
+  if (strNewest.empty()) {
+    throw Failure("no tesselupgrader is installed beside this program (--tool names another)");
+  }
+  return strNewest;
+}
+
+// --- What a run tells ---
+
+// A datagram socket that the tool's syslog goes to.
+int BindSyslog(const std::string& strName) {
+  sockaddr_un Address = {};
+  Address.sun_family = AF_UNIX;
+  if (strName.size() >= sizeof(Address.sun_path)) {
+    throw Failure("the name of the temporary directory is too long: " + strName);
+  }
+  strName.copy(Address.sun_path, strName.size());
+  unlink(strName.c_str());
+  const int Fd = socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
+  if (Fd == -1 || bind(Fd, reinterpret_cast<sockaddr*>(&Address), sizeof(Address)) != 0) {
+    throw SystemFailure("cannot make a socket " + strName);
+  }
+  return Fd;
+}
+
+// The close in between keeps the system from reporting several openings as one.
+int WatchOpenings(const std::string& strDir) {
+  const int Fd = inotify_init1(IN_CLOEXEC | IN_NONBLOCK);
+  if (Fd == -1 || inotify_add_watch(Fd, strDir.c_str(), IN_OPEN | IN_CLOSE) == -1) {
+    throw SystemFailure("cannot watch " + strDir);
+  }
+  return Fd;
+}
+
+// Openings of the directory itself: their events have no name.
+int CountOpenings(int Fd) {
+  alignas(inotify_event) char rgBuf[65536];
+  int Count = 0;
+  ssize_t Len;
+  while ((Len = read(Fd, rgBuf, sizeof(rgBuf))) > 0) {
+    for (ssize_t Pos = 0; Pos < Len;) {
+      const auto* pEvent = reinterpret_cast<const inotify_event*>(&rgBuf[Pos]);
+      Count += pEvent->len == 0 && (pEvent->mask & IN_OPEN) != 0 ? 1 : 0;
+      Pos += static_cast<ssize_t>(sizeof(inotify_event) + pEvent->len);
+    }
+  }
+  return Count;
+}
+
+// The text between the last strBegin before the first strEnd, and that; "" if they are not there.
+std::string Between(const std::string& strText, const char* szBegin, const char* szEnd) {
+  const size_t End = strText.find(szEnd);
+  const size_t Begin = End == std::string::npos ? End : strText.rfind(szBegin, End);
+  if (Begin == std::string::npos) {
+    return "";
+  }
+  const size_t Start = Begin + strlen(szBegin);
+  return strText.substr(Start, End - Start);
+}
+
+// The log names the failed actions, in the order in which the executor has sent their reasons.
+std::vector<FAILED_ACTION> FailedActions(const std::string& strLog,
+                                         const std::vector<std::string>& Records) {
+  std::vector<FAILED_ACTION> Failures;
+  std::istringstream Log(strLog);
+  for (std::string strLine; std::getline(Log, strLine);) {
+    const std::string strName = Between(strLine, ":", "(): KiDBExecute command (");
+    if (!strName.empty()) {
+      Failures.push_back({strName, "the database cannot be opened", false});
+    }
+  }
+  size_t Action = 0;
+  for (const std::string& strRecord : Records) {
+    const std::string strReason = Between(strRecord, "]: ", " (extended code ");
+    if (strRecord.find("zamodb: [") != std::string::npos && Action < Failures.size()) {
+      Failures[Action++].strReason = strReason;
+    }
+  }
+  return Failures;
+}
+
+// A file that could not be read or replaced: the record has its name, the step and errno.
+void AddFailedFiles(const std::vector<std::string>& Records, std::vector<FAILED_ACTION>* pFailed) {
+  for (const std::string& strRecord : Records) {
+    const std::string strFile = Between(strRecord, "zamoc: [", "]: ");
+    const std::string strStep = Between(strRecord, "]: ", " failed with errno [");
+    const std::string strErrno = Between(strRecord, "[", "]\n").empty()
+                                     ? strRecord.substr(strRecord.rfind('[') + 1)
+                                     : Between(strRecord, "[", "]\n");
+    if (!strFile.empty() && !strStep.empty()) {
+      pFailed->push_back({"capability file " + strFile.substr(strFile.rfind('/') + 1),
+                          strStep + ": " + strerror(atoi(strErrno.c_str())), true});
+    }
+  }
+}
+
+}  // namespace
+
+Tool::Tool(const std::string& strTool, const std::string& strTarget)
+    : m_strTool(strTool), m_strTarget(strTarget) {
+  const std::string strOwnDir = OwnDirectory();
+  m_strHelper = FindHelper(strOwnDir);
+  if (m_strTool.empty()) {
+    m_strTool = FindTool(strOwnDir);
+  }
+  if (access(m_strTool.c_str(), X_OK) != 0) {
+    throw SystemFailure("cannot run " + m_strTool);
+  }
+  m_strTool = std::filesystem::canonical(m_strTool);
+  std::filesystem::create_directories(CapDir());
+}
+
+// Without arguments the tool prints its name and version, and how to call it.
+std::string Tool::Describe() const {
+  const COMMAND_RESULT Result = RunCommand({m_strHelper, m_strTarget, m_strTool});
+  if (Result.Status != 1) {
+    throw Failure("cannot run " + m_strTool + ": " + FirstLine(Result.strOutput));
+  }
+  return FirstLine(Result.strOutput) + " (" + m_strTool + ")";
+}
+
+UPGRADE Tool::Upgrade(const std::string& strVersion) const {
+  const Descriptor Syslog(BindSyslog(m_strTarget + "/syslog"));
+  const Descriptor Openings(WatchOpenings(CapDir()));
+  const COMMAND_RESULT Result =
+      RunCommand({m_strHelper, m_strTarget, m_strTool, strVersion}, Syslog.Get());
+  if (Result.Status != 0 && Result.Status != FAILED_STATUS) {
+    throw Failure("cannot run " + m_strTool + ": " +
+                  (Result.Status > 128
+                       ? "it was ended by " + std::string(strsignal(Result.Status - 128))
+                       : FirstLine(Result.strOutput)));
+  }
+  UPGRADE Upgrade;
+  Upgrade.Status = Result.Status;
+  const std::string strLog = m_strTarget + "/log/camveld.log";
+  Upgrade.Failures = FailedActions(Exists(strLog) ? ReadWholeFile(strLog) : "", Result.Records);
+  AddFailedFiles(Result.Records, &Upgrade.Failures);
+  Upgrade.CapActions = CountOpenings(Openings.Get());
+  return Upgrade;
+}
