@@ -17,8 +17,8 @@ void Print(const std::string& strText) { fwrite(strText.data(), 1, strText.size(
 std::string Name(const std::string& strName) {
   std::string strShown;
   for (const char Char : strName) {
-    strShown +=
-        (Char >= 0 && Char < 0x20) || Char == 0x7f ? "\\x" + Hex({Char}) : std::string{Char};
+    const auto Byte = static_cast<unsigned char>(Char);
+    strShown += Byte < 0x20 || Byte == 0x7f ? "\\x" + Hex({Char}) : std::string{Char};
   }
   return strShown;
 }
