@@ -9,11 +9,11 @@
 
 void CopyCapFiles(const std::string& strFrom, const std::string& strTo) {
   for (const std::string& strName : ListDirectory(strFrom)) {
-    const std::string strFile = strFrom + "/" + strName;
+    const std::string strFile = FileIn(strFrom, strName);
     struct stat Stat;
     if (stat(strFile.c_str(), &Stat) == 0 && S_ISREG(Stat.st_mode)) {
       const Descriptor File(OpenFile(strFile, O_RDONLY | O_NONBLOCK));
-      CopyTo(File.Get(), strFile, strTo + "/" + strName, 0600);
+      CopyTo(File.Get(), strFile, FileIn(strTo, strName), 0600);
     }
   }
 }
@@ -21,7 +21,7 @@ void CopyCapFiles(const std::string& strFrom, const std::string& strTo) {
 std::vector<std::string> ChangedFiles(const std::string& strBefore, const std::string& strAfter) {
   std::vector<std::string> Changed;
   for (const std::string& strName : ListDirectory(strBefore)) {
-    if (ReadWholeFile(strBefore + "/" + strName) != ReadWholeFile(strAfter + "/" + strName)) {
+    if (ReadWholeFile(FileIn(strBefore, strName)) != ReadWholeFile(FileIn(strAfter, strName))) {
       Changed.push_back(strName);
     }
   }

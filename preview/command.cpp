@@ -18,6 +18,7 @@ constexpr size_t MAX_RECORD_BYTES = 65536;
 
 [[noreturn]] void Become(const std::vector<std::string>& Arguments, int OutputFd) {
   std::vector<char*> Argv;
+  Argv.reserve(Arguments.size() + 1);
   for (const std::string& strArgument : Arguments) {
     Argv.push_back(const_cast<char*>(strArgument.c_str()));
   }

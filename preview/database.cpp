@@ -3,9 +3,9 @@
 Database::Database(const std::string& strName, int Flags) {
   const int Code = sqlite3_open_v2(strName.c_str(), &m_pDb, Flags | SQLITE_OPEN_NOMUTEX, nullptr);
   if (Code != SQLITE_OK) {
-    const SqlFailure Reason(Code, m_pDb == nullptr ? sqlite3_errstr(Code) : sqlite3_errmsg(m_pDb));
+    const std::string strReason = m_pDb == nullptr ? sqlite3_errstr(Code) : sqlite3_errmsg(m_pDb);
     sqlite3_close(m_pDb);
-    throw Reason;
+    throw SqlFailure(Code, strReason);
   }
 }
 

@@ -26,6 +26,11 @@ int OpenFile(const std::string& strFile, int Flags, mode_t Mode = 0);
 bool Exists(const std::string& strFile);
 bool IsDirectory(const std::string& strFile);
 
+// The name of a file in a directory.
+inline std::string FileIn(const std::string& strDir, const std::string& strName) {
+  return strDir + "/" + strName;
+}
+
 // The names in a directory but "." and "..", in the order of their bytes.
 std::vector<std::string> ListDirectory(const std::string& strDir);
 

@@ -146,7 +146,8 @@ void ReportFailures(const UPGRADE& Upgrade, Report* pReport, Tally* pTally) {
 
 int ListActions(const OPTIONS& Options) {
   // Without a database every action fails, and the log names it.
-  const UPGRADE Upgrade = Tool(Options.strTool, "target").Upgrade(Options.strVersion);
+  const UPGRADE Upgrade =
+      Tool(Options.strTool, Options.strOwnProgram, "target").Upgrade(Options.strVersion);
   for (const FAILED_ACTION& Action : Upgrade.Failures) {
     puts(Action.strName.c_str());
   }
@@ -157,7 +158,7 @@ int ListActions(const OPTIONS& Options) {
 }
 
 int PreviewUpgrade(const OPTIONS& Options) {
-  const Tool Tool(Options.strTool, "target");
+  const Tool Tool(Options.strTool, Options.strOwnProgram, "target");
   const std::unique_ptr<Report> pReport = MakeReport(Options.Mode);
   std::unique_ptr<UndoDirectory> pUndoDirectory;
   std::unique_ptr<UndoScript> pUndo;

@@ -163,6 +163,7 @@ OPTIONS ParseOptions(int argc, char* argv[]) {
   }
   SetPositional(argc - optind, argv + optind, &Options);
   CompleteNames(&Options);
+  Options.strOwnProgram = std::filesystem::read_symlink("/proc/self/exe");
   FindCaps(&Options);
   return Options;
 }

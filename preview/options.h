@@ -12,7 +12,8 @@ struct OPTIONS {
   std::string strTool;     // empty: to be looked for
   std::string strUndoDir;  // empty: no way back is written
   std::string strVersion;
-  bool blDone = false;  // --help or --version: everything is printed
+  std::string strOwnProgram;  // the file, which an emulator knows only before the first chdir
+  bool blDone = false;        // --help or --version: everything is printed
 };
 
 // Reads the command line. Throws Failure.

@@ -53,7 +53,7 @@ int WaitForChild(pid_t Child, const sigset_t& Signals, int* pStatus) {
       kill(Child, SIGKILL);
     }
   }
-  // What the child started dies with it, and is handed to this process.
+  // What the child started dies with it, and is handed to this process (not by all emulators).
   while (wait(nullptr) != -1 || errno == EINTR) {
   }
   return Caught;

@@ -24,12 +24,10 @@ std::string FirstLine(const std::string& strText) { return strText.substr(0, str
 
 // --- Where the programs are ---
 
-std::string OwnDirectory() { return std::filesystem::read_symlink("/proc/self/exe").parent_path(); }
-
 // Installed it is in libexec; a build tree is build/PRESET of the source tree.
 std::string FindHelper(const std::string& strOwnDir) {
   for (const char* szPlace : {"/../libexec/tesselupgrader/", "/../../../tools/"}) {
-    const std::string strHelper = strOwnDir + szPlace + "private-appliance";
+    std::string strHelper = strOwnDir + szPlace + "private-appliance";
     if (Exists(strHelper)) {
       return strHelper;
     }
@@ -46,13 +44,13 @@ std::string Processor(const std::string& strProgram) {
   return strHead.compare(0, 4, "\177ELF") == 0 ? strHead.substr(4, 1) + strHead.substr(18) : "";
 }
 
-bool IsRunnable(const std::string& strTool) {
+bool IsRunnable(const std::string& strTool, const std::string& strOwnProgram) {
   const std::string strProcessor = Processor(strTool);
   return access(strTool.c_str(), X_OK) == 0 && !IsDirectory(strTool) &&
-         (strProcessor.empty() || strProcessor == Processor("/proc/self/exe"));
+         (strProcessor.empty() || strProcessor == Processor(strOwnProgram));
 }
 
-std::string FindTool(const std::string& strOwnDir) {
+std::string FindTool(const std::string& strOwnProgram, const std::string& strOwnDir) {
   std::vector<std::string> Tools = {strOwnDir + "/tesselupgrader"};
   if (Exists(strOwnDir + "/../../../tools/private-appliance")) {
     const std::string strBuild = strOwnDir + "/../../";
@@ -63,7 +61,7 @@ std::string FindTool(const std::string& strOwnDir) {
   std::string strNewest;
   std::filesystem::file_time_type Newest;
   for (const std::string& strTool : Tools) {
-    if (IsRunnable(strTool)) {
+    if (IsRunnable(strTool, strOwnProgram)) {
       const auto Time = std::filesystem::last_write_time(strTool);
       if (strNewest.empty() || Time > Newest) {
         strNewest = strTool;
@@ -160,20 +158,23 @@ void AddFailedFiles(const std::vector<std::string>& Records, std::vector<FAILED_
                                      ? strRecord.substr(strRecord.rfind('[') + 1)
                                      : Between(strRecord, "[", "]\n");
     if (!strFile.empty() && !strStep.empty()) {
-      pFailed->push_back({"capability file " + strFile.substr(strFile.rfind('/') + 1),
-                          strStep + ": " + strerror(atoi(strErrno.c_str())), true});
+      pFailed->push_back(
+          {"capability file " + strFile.substr(strFile.rfind('/') + 1),
+           strStep + ": " + strerror(static_cast<int>(strtol(strErrno.c_str(), nullptr, 10))),
+           true});
     }
   }
 }
 
 }  // namespace
 
-Tool::Tool(const std::string& strTool, const std::string& strTarget)
+Tool::Tool(const std::string& strTool, const std::string& strOwnProgram,
+           const std::string& strTarget)
     : m_strTool(strTool), m_strTarget(strTarget) {
-  const std::string strOwnDir = OwnDirectory();
+  const std::string strOwnDir = std::filesystem::path(strOwnProgram).parent_path();
   m_strHelper = FindHelper(strOwnDir);
   if (m_strTool.empty()) {
-    m_strTool = FindTool(strOwnDir);
+    m_strTool = FindTool(strOwnProgram, strOwnDir);
   }
   if (access(m_strTool.c_str(), X_OK) != 0) {
     throw SystemFailure("cannot run " + m_strTool);

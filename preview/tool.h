@@ -22,7 +22,7 @@ class Tool {
  public:
   // Runs strTool, or the newest tool of this processor among those installed and built beside this
   // program when it is empty, on the directory strTarget, which must exist.
-  Tool(const std::string& strTool, const std::string& strTarget);
+  Tool(const std::string& strTool, const std::string& strOwnProgram, const std::string& strTarget);
 
   // "tesselupgrader 1.0.0 (FILE)".
   std::string Describe() const;
