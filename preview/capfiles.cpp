@@ -33,7 +33,7 @@ std::string Diff(const std::vector<std::string>& Options, const std::string& str
   std::vector<std::string> Command = {"diff", "--unified", "--text"};
   Command.insert(Command.end(), Options.begin(), Options.end());
   Command.insert(Command.end(), {strFrom, strTo});
-  const COMMAND_RESULT Result = RunCommand(Command);
+  const CommandResult Result = RunCommand(Command);
   if (Result.Status != 1) {
     throw Failure("cannot compare capability files: " +
                   Result.strOutput.substr(0, Result.strOutput.find('\n')));

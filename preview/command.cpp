@@ -42,7 +42,7 @@ void ReadRecords(int SyslogFd, std::vector<std::string>* pRecords) {
 }
 
 // Reads until the program and all it has started have closed their end.
-void Collect(int OutputFd, int SyslogFd, COMMAND_RESULT* pResult) {
+void Collect(int OutputFd, int SyslogFd, CommandResult* pResult) {
   char rgBuf[16384];
   while (true) {
     pollfd rgPoll[] = {{OutputFd, POLLIN, 0}, {SyslogFd, POLLIN, 0}};
@@ -65,7 +65,7 @@ void Collect(int OutputFd, int SyslogFd, COMMAND_RESULT* pResult) {
 
 }  // namespace
 
-COMMAND_RESULT RunCommand(const std::vector<std::string>& Arguments, int SyslogFd) {
+CommandResult RunCommand(const std::vector<std::string>& Arguments, int SyslogFd) {
   int rgPipe[2];
   if (pipe2(rgPipe, O_CLOEXEC) != 0) {
     throw SystemFailure("pipe");
@@ -80,7 +80,7 @@ COMMAND_RESULT RunCommand(const std::vector<std::string>& Arguments, int SyslogF
     Become(Arguments, Write.Get());
   }
   Write.Close();
-  COMMAND_RESULT Result;
+  CommandResult Result;
   Collect(Read.Get(), SyslogFd, &Result);
   int Status = 0;
   while (waitpid(Child, &Status, 0) == -1 && errno == EINTR) {

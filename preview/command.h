@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-struct COMMAND_RESULT {
+struct CommandResult {
   int Status = 0;                    // exit status; 128 and the signal's number if one ended it
   std::string strOutput;             // of standard output and standard error
   std::vector<std::string> Records;  // the datagrams that came in while it ran
@@ -13,4 +13,4 @@ struct COMMAND_RESULT {
 // Runs a program, found in PATH unless its name has a slash, with nothing to read. Reads datagrams
 // from the socket SyslogFd meanwhile, unless that is -1. The program dies with this process.
 // Throws Failure.
-COMMAND_RESULT RunCommand(const std::vector<std::string>& Arguments, int SyslogFd = -1);
+CommandResult RunCommand(const std::vector<std::string>& Arguments, int SyslogFd = -1);

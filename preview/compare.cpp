@@ -6,18 +6,18 @@
 
 namespace {
 
-struct LISTED_TABLE {
+struct ListedTable {
   std::string strName;
   std::string strType;
   bool blHasRowid;
 };
 
-std::vector<LISTED_TABLE> ListTables(const Database& Db) {
+std::vector<ListedTable> ListTables(const Database& Db) {
   Statement List(Db,
                  "SELECT name, type, NOT wr FROM pragma_table_list WHERE schema = 'main' AND "
                  "(name NOT LIKE 'sqlite\\_%' ESCAPE '\\' OR name = 'sqlite_sequence') "
                  "ORDER BY name");
-  std::vector<LISTED_TABLE> Tables;
+  std::vector<ListedTable> Tables;
   while (List.Step()) {
     Tables.push_back({List.Text(0), List.Text(1), List.Int(2) != 0});
   }
@@ -28,13 +28,14 @@ bool IsName(const std::string& strA, const std::string& strB) {
   return sqlite3_stricmp(strA.c_str(), strB.c_str()) == 0;
 }
 
-int FindColumn(const TABLE& Table, const std::string& strName) {
-  const auto Column = std::find_if(Table.Columns.begin(), Table.Columns.end(),
-                                   [&](const COLUMN& It) { return IsName(It.strName, strName); });
+int FindColumn(const TableInfo& Table, const std::string& strName) {
+  const auto Column =
+      std::find_if(Table.Columns.begin(), Table.Columns.end(),
+                   [&](const ColumnInfo& It) { return IsName(It.strName, strName); });
   return Column == Table.Columns.end() ? -1 : static_cast<int>(Column - Table.Columns.begin());
 }
 
-void ReadColumns(const Database& Db, TABLE* pTable) {
+void ReadColumns(const Database& Db, TableInfo* pTable) {
   Statement Info(Db, "SELECT name, hidden FROM pragma_table_xinfo(?, 'main')");
   Info.Bind(1, pTable->strName);
   while (Info.Step()) {
@@ -47,7 +48,7 @@ void ReadColumns(const Database& Db, TABLE* pTable) {
 }
 
 // Leaves the keys empty when columns hide all names of the rowid.
-void ReadKeys(const Database& Db, TABLE* pTable) {
+void ReadKeys(const Database& Db, TableInfo* pTable) {
   for (const char* szName : {"rowid", "_rowid_", "oid"}) {
     if (pTable->blHasRowid && pTable->Keys.empty() && FindColumn(*pTable, szName) == -1) {
       pTable->Keys = {szName};
@@ -62,19 +63,19 @@ void ReadKeys(const Database& Db, TABLE* pTable) {
   }
 }
 
-// Keys and columns under an alias, as ROW has them.
-std::string Selected(const TABLE& Table, const std::string& strAlias) {
+// Keys and columns under an alias, as TableRow has them.
+std::string Selected(const TableInfo& Table, const std::string& strAlias) {
   std::string strSql;
   for (const std::string& strKey : Table.Keys) {
     strSql += ", " + strAlias + "." + Quoted(strKey);
   }
-  for (const COLUMN& Column : Table.Columns) {
+  for (const ColumnInfo& Column : Table.Columns) {
     strSql += ", " + strAlias + "." + Quoted(Column.strName);
   }
   return strSql.substr(2);
 }
 
-std::string SameKeys(const TABLE& Table) {
+std::string SameKeys(const TableInfo& Table) {
   std::string strSql;
   for (const std::string& strKey : Table.Keys) {
     strSql += " AND a." + Quoted(strKey) + " = b." + Quoted(strKey);
@@ -83,13 +84,14 @@ std::string SameKeys(const TABLE& Table) {
 }
 
 // A key is never NULL: where it is, there is no such row.
-void CompareKept(const Database& Db, const TABLE& Table, ChangeSink* pSink) {
+void CompareKept(const Database& Db, const TableInfo& Table, ChangeSink* pSink) {
   const std::string strName = Quoted(Table.strName);
   Statement Rows(Db, "SELECT " + Selected(Table, "b") + ", " + Selected(Table, "a") +
                          " FROM main." + strName + " AS b NOT INDEXED LEFT JOIN after." + strName +
                          " AS a ON " + SameKeys(Table));
-  const ROW Before(Table, Rows.Get(), 0);
-  const ROW After(Table, Rows.Get(), static_cast<int>(Table.Keys.size() + Table.Columns.size()));
+  const TableRow Before(Table, Rows.Get(), 0);
+  const TableRow After(Table, Rows.Get(),
+                       static_cast<int>(Table.Keys.size() + Table.Columns.size()));
   while (Rows.Step()) {
     if (sqlite3_value_type(After.Key(0)) == SQLITE_NULL) {
       pSink->Removed(Before);
@@ -103,19 +105,19 @@ void CompareKept(const Database& Db, const TABLE& Table, ChangeSink* pSink) {
   }
 }
 
-void CompareAdded(const Database& Db, const TABLE& Table, ChangeSink* pSink) {
+void CompareAdded(const Database& Db, const TableInfo& Table, ChangeSink* pSink) {
   const std::string strName = Quoted(Table.strName);
   Statement Rows(Db, "SELECT " + Selected(Table, "a") + " FROM after." + strName +
                          " AS a NOT INDEXED WHERE NOT EXISTS (SELECT 1 FROM main." + strName +
                          " AS b WHERE " + SameKeys(Table) + ")");
-  const ROW After(Table, Rows.Get(), 0);
+  const TableRow After(Table, Rows.Get(), 0);
   while (Rows.Step()) {
     pSink->Added(After);
   }
 }
 
-void CompareTable(const Database& Db, const LISTED_TABLE& Listed, ChangeSink* pSink) {
-  TABLE Table;
+void CompareTable(const Database& Db, const ListedTable& Listed, ChangeSink* pSink) {
+  TableInfo Table;
   Table.strName = Listed.strName;
   Table.blHasRowid = Listed.blHasRowid;
   try {
@@ -139,7 +141,7 @@ void CompareTable(const Database& Db, const LISTED_TABLE& Listed, ChangeSink* pS
 }  // namespace
 
 void Compare(const Database& Db, ChangeSink* pSink, ChangeSink* pBookkeeping) {
-  for (const LISTED_TABLE& Listed : ListTables(Db)) {
+  for (const ListedTable& Listed : ListTables(Db)) {
     if (Listed.strType == "view" || Listed.strType == "virtual") {
       pSink->NotCompared(Listed.strName, Listed.strType == "view" ? "view" : "virtual table");
     } else if (Listed.strName != "sqlite_sequence") {

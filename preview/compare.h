@@ -6,14 +6,14 @@
 
 #include "database.h"
 
-struct COLUMN {
+struct ColumnInfo {
   std::string strName;
   bool blGenerated;  // it follows from others and cannot be set
 };
 
-struct TABLE {
+struct TableInfo {
   std::string strName;
-  std::vector<COLUMN> Columns;
+  std::vector<ColumnInfo> Columns;
   // What a row is known by: a name of its rowid, or the columns of its primary key.
   std::vector<std::string> Keys;
   bool blHasRowid = false;
@@ -22,18 +22,18 @@ struct TABLE {
 };
 
 // The current row of a statement: keys first, then columns.
-class ROW {
+class TableRow {
  public:
-  ROW(const TABLE& Table, sqlite3_stmt* pStatement, int First)
+  TableRow(const TableInfo& Table, sqlite3_stmt* pStatement, int First)
       : m_Table(Table), m_pStatement(pStatement), m_First(First) {}
-  const TABLE& Table() const { return m_Table; }
+  const TableInfo& Table() const { return m_Table; }
   sqlite3_value* Key(size_t Idx) const {
     return sqlite3_column_value(m_pStatement, m_First + static_cast<int>(Idx));
   }
   sqlite3_value* Column(size_t Idx) const { return Key(m_Table.Keys.size() + Idx); }
 
  private:
-  const TABLE& m_Table;
+  const TableInfo& m_Table;
   sqlite3_stmt* const m_pStatement;
   const int m_First;
 };
@@ -42,9 +42,9 @@ class ROW {
 class ChangeSink {
  public:
   virtual ~ChangeSink() = default;
-  virtual void Cell(const ROW& Before, const ROW& After, size_t Column) = 0;
-  virtual void Added(const ROW& After) = 0;
-  virtual void Removed(const ROW& Before) = 0;
+  virtual void Cell(const TableRow& Before, const TableRow& After, size_t Column) = 0;
+  virtual void Added(const TableRow& After) = 0;
+  virtual void Removed(const TableRow& Before) = 0;
   // strWhat is "view" or "virtual table", or the reason.
   virtual void NotCompared(const std::string& strTable, const std::string& strWhat) = 0;
 };

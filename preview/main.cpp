@@ -36,17 +36,17 @@ constexpr const char* UNDO_PATCH = "undo.patch";
 class FanOut : public ChangeSink {
  public:
   void Add(ChangeSink* pSink) { m_Sinks.push_back(pSink); }
-  void Cell(const ROW& Before, const ROW& After, size_t Column) override {
+  void Cell(const TableRow& Before, const TableRow& After, size_t Column) override {
     for (ChangeSink* pSink : m_Sinks) {
       pSink->Cell(Before, After, Column);
     }
   }
-  void Added(const ROW& After) override {
+  void Added(const TableRow& After) override {
     for (ChangeSink* pSink : m_Sinks) {
       pSink->Added(After);
     }
   }
-  void Removed(const ROW& Before) override {
+  void Removed(const TableRow& Before) override {
     for (ChangeSink* pSink : m_Sinks) {
       pSink->Removed(Before);
     }
@@ -67,13 +67,13 @@ bool HasColour() {
 }
 
 // Null for --check, which prints nothing.
-std::unique_ptr<Report> MakeReport(MODE Mode) {
+std::unique_ptr<Report> MakeReport(OutputMode Mode) {
   switch (Mode) {
-    case MODE::TEXT:
+    case OutputMode::TEXT:
       return std::make_unique<TextReport>(HasColour());
-    case MODE::SUMMARY:
+    case OutputMode::SUMMARY:
       return std::make_unique<SummaryReport>();
-    case MODE::JSON:
+    case OutputMode::JSON:
       return std::make_unique<JsonReport>();
     default:
       return nullptr;
@@ -87,7 +87,7 @@ void Recover(const std::string& strCopy) {
   Database(strCopy, SQLITE_OPEN_READWRITE).Execute("SELECT count(*) FROM sqlite_schema");
 }
 
-void CopyAppliance(const OPTIONS& Options, const Tool& Tool) {
+void CopyAppliance(const CommandLine& Options, const Tool& Tool) {
   CopyDatabase(Options.strDatabase, BEFORE_DATABASE);
   Recover(BEFORE_DATABASE);
   const Descriptor Before(OpenFile(BEFORE_DATABASE, O_RDONLY));
@@ -134,9 +134,9 @@ void CompareCapFiles(Report* pReport, Tally* pTally, bool blUndo) {
   }
 }
 
-void ReportFailures(const UPGRADE& Upgrade, Report* pReport, Tally* pTally) {
+void ReportFailures(const UpgradeRun& Upgrade, Report* pReport, Tally* pTally) {
   pTally->m_Status = Upgrade.Status;
-  for (const FAILED_ACTION& Failed : Upgrade.Failures) {
+  for (const FailedAction& Failed : Upgrade.Failures) {
     pTally->m_Failed += Failed.blFile ? 0 : 1;
     if (pReport != nullptr) {
       pReport->Failed(Failed);
@@ -144,11 +144,11 @@ void ReportFailures(const UPGRADE& Upgrade, Report* pReport, Tally* pTally) {
   }
 }
 
-int ListActions(const OPTIONS& Options) {
+int ListActions(const CommandLine& Options) {
   // Without a database every action fails, and the log names it.
-  const UPGRADE Upgrade =
+  const UpgradeRun Upgrade =
       Tool(Options.strTool, Options.strOwnProgram, "target").Upgrade(Options.strVersion);
-  for (const FAILED_ACTION& Action : Upgrade.Failures) {
+  for (const FailedAction& Action : Upgrade.Failures) {
     puts(Action.strName.c_str());
   }
   if (Upgrade.CapActions > 0) {
@@ -157,7 +157,7 @@ int ListActions(const OPTIONS& Options) {
   return 0;
 }
 
-int PreviewUpgrade(const OPTIONS& Options) {
+int PreviewUpgrade(const CommandLine& Options) {
   const Tool Tool(Options.strTool, Options.strOwnProgram, "target");
   const std::unique_ptr<Report> pReport = MakeReport(Options.Mode);
   std::unique_ptr<UndoDirectory> pUndoDirectory;
@@ -167,10 +167,10 @@ int PreviewUpgrade(const OPTIONS& Options) {
     pUndo = std::make_unique<UndoScript>(UNDO_SQL, Options.strVersion);
   }
   CopyAppliance(Options, Tool);
-  if (Options.Mode == MODE::TEXT || Options.Mode == MODE::SUMMARY) {
+  if (Options.Mode == OutputMode::TEXT || Options.Mode == OutputMode::SUMMARY) {
     puts(Tool.Describe().c_str());
   }
-  const UPGRADE Upgrade = Tool.Upgrade(Options.strVersion);
+  const UpgradeRun Upgrade = Tool.Upgrade(Options.strVersion);
   Tally Tally;
   CompareDatabases(pReport.get(), &Tally, pUndo.get());
   if (!Options.strCaps.empty()) {
@@ -187,7 +187,7 @@ int PreviewUpgrade(const OPTIONS& Options) {
     pUndoDirectory->Deliver(UNDO_SQL, "system.db.sql");
     pUndoDirectory->Deliver(UNDO_PATCH, "KICapInfo.patch");
   }
-  return Options.Mode == MODE::CHECK && !Tally.IsEmpty() ? WOULD_CHANGE : Upgrade.Status;
+  return Options.Mode == OutputMode::CHECK && !Tally.IsEmpty() ? WOULD_CHANGE : Upgrade.Status;
 }
 
 // --- Failures ---
@@ -213,19 +213,20 @@ int Fail(const std::string& strWhat) {
   return NO_PREVIEW;
 }
 
-int FailDatabase(const OPTIONS& Options, const SqlFailure& Reason) {
+int FailDatabase(const CommandLine& Options, const SqlFailure& Reason) {
   if (Reason.Code() == SQLITE_CORRUPT || Reason.Code() == SQLITE_NOTADB) {
     return Fail(Options.strDatabase + " is damaged: " + FirstDamage());
   }
   return Fail(Options.strDatabase + ": " + Reason.what());
 }
 
-int Preview(const OPTIONS& Options, const std::string& strWorkDir) {
+int Preview(const CommandLine& Options, const std::string& strWorkDir) {
   try {
     std::filesystem::current_path(strWorkDir);
     std::filesystem::create_directory("target");
     setenv("LC_ALL", "C", 1);  // for the messages of other programs
-    const int Status = Options.Mode == MODE::LIST ? ListActions(Options) : PreviewUpgrade(Options);
+    const int Status =
+        Options.Mode == OutputMode::LIST ? ListActions(Options) : PreviewUpgrade(Options);
     if (fflush(stdout) != 0 || ferror(stdout) != 0) {
       throw SystemFailure("cannot write the output");
     }
@@ -241,7 +242,7 @@ int Preview(const OPTIONS& Options, const std::string& strWorkDir) {
 
 int main(int argc, char* argv[]) {
   try {
-    const OPTIONS Options = ParseOptions(argc, argv);
+    const CommandLine Options = ParseOptions(argc, argv);
     if (Options.blDone) {
       return fflush(stdout) == 0 ? 0 : Fail("cannot write the output");
     }

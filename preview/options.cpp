@@ -34,7 +34,7 @@ constexpr const char* HELP =
     "\n"
     "Status: the tool's (0, 255), 3 from --check, 2 when no preview could be made.\n";
 
-enum OPTION { CAPS = 1, HELP_TEXT, PROGRAM_VERSION, TOOL, UNDO, FIRST_MODE };
+enum OptionCode { CAPS = 1, HELP_TEXT, PROGRAM_VERSION, TOOL, UNDO, FIRST_MODE };
 
 constexpr option OPTION_LIST[] = {
     {"caps", required_argument, nullptr, CAPS},
@@ -42,10 +42,10 @@ constexpr option OPTION_LIST[] = {
     {"version", no_argument, nullptr, PROGRAM_VERSION},
     {"tool", required_argument, nullptr, TOOL},
     {"undo", required_argument, nullptr, UNDO},
-    {"summary", no_argument, nullptr, FIRST_MODE + static_cast<int>(MODE::SUMMARY)},
-    {"json", no_argument, nullptr, FIRST_MODE + static_cast<int>(MODE::JSON)},
-    {"list", no_argument, nullptr, FIRST_MODE + static_cast<int>(MODE::LIST)},
-    {"check", no_argument, nullptr, FIRST_MODE + static_cast<int>(MODE::CHECK)},
+    {"summary", no_argument, nullptr, FIRST_MODE + static_cast<int>(OutputMode::SUMMARY)},
+    {"json", no_argument, nullptr, FIRST_MODE + static_cast<int>(OutputMode::JSON)},
+    {"list", no_argument, nullptr, FIRST_MODE + static_cast<int>(OutputMode::LIST)},
+    {"check", no_argument, nullptr, FIRST_MODE + static_cast<int>(OutputMode::CHECK)},
     {nullptr, 0, nullptr, 0},
 };
 
@@ -69,8 +69,8 @@ void CheckVersion(const std::string& strVersion) {
   }
 }
 
-void SetMode(MODE Mode, MODE* pMode) {
-  if (*pMode != MODE::TEXT && *pMode != Mode) {
+void SetMode(OutputMode Mode, OutputMode* pMode) {
+  if (*pMode != OutputMode::TEXT && *pMode != Mode) {
     throw Failure("only one of --summary, --json, --list and --check can be given");
   }
   *pMode = Mode;
@@ -83,13 +83,13 @@ void SetFile(const char* szName, const char* szValue, std::string* pFile) {
   *pFile = szValue;
 }
 
-void Print(OPTIONS* pOptions, const char* szText) {
+void Print(CommandLine* pOptions, const char* szText) {
   fputs(szText, stdout);
   pOptions->blDone = true;
 }
 
 // The capability files beside the database are looked at when they are there.
-void FindCaps(OPTIONS* pOptions) {
+void FindCaps(CommandLine* pOptions) {
   const bool blBeside = pOptions->strCaps.empty();
   if (blBeside) {
     pOptions->strCaps =
@@ -104,7 +104,7 @@ void FindCaps(OPTIONS* pOptions) {
 }
 
 // Files are named as from the root: a preview has a working directory of its own.
-void CompleteNames(OPTIONS* pOptions) {
+void CompleteNames(CommandLine* pOptions) {
   for (std::string* pFile :
        {&pOptions->strDatabase, &pOptions->strCaps, &pOptions->strTool, &pOptions->strUndoDir}) {
     if (!pFile->empty()) {
@@ -116,7 +116,7 @@ void CompleteNames(OPTIONS* pOptions) {
   }
 }
 
-void SetPositional(int Count, char* szArguments[], OPTIONS* pOptions) {
+void SetPositional(int Count, char* szArguments[], CommandLine* pOptions) {
   if (Count < 1 || Count > 2) {
     throw Failure(Count < 1 ? "VERSION is missing (--help says more)"
                             : std::string("too many arguments, from ") + szArguments[2] + " on");
@@ -128,8 +128,8 @@ void SetPositional(int Count, char* szArguments[], OPTIONS* pOptions) {
 
 }  // namespace
 
-OPTIONS ParseOptions(int argc, char* argv[]) {
-  OPTIONS Options;
+CommandLine ParseOptions(int argc, char* argv[]) {
+  CommandLine Options;
   int Option;
   int Index = 0;
   opterr = 0;
@@ -154,11 +154,11 @@ OPTIONS ParseOptions(int argc, char* argv[]) {
         throw Failure(std::string("unknown, ambiguous or incomplete option: ") + argv[optind - 1] +
                       " (--help says more)");
       default:
-        SetMode(static_cast<MODE>(Option - FIRST_MODE), &Options.Mode);
+        SetMode(static_cast<OutputMode>(Option - FIRST_MODE), &Options.Mode);
         break;
     }
   }
-  if (Options.Mode == MODE::LIST && !Options.strUndoDir.empty()) {
+  if (Options.Mode == OutputMode::LIST && !Options.strUndoDir.empty()) {
     throw Failure("--list changes nothing that --undo could take back");
   }
   SetPositional(argc - optind, argv + optind, &Options);

@@ -3,10 +3,10 @@
 
 #include <string>
 
-enum class MODE { TEXT, SUMMARY, JSON, LIST, CHECK };
+enum class OutputMode { TEXT, SUMMARY, JSON, LIST, CHECK };
 
-struct OPTIONS {
-  MODE Mode = MODE::TEXT;
+struct CommandLine {
+  OutputMode Mode = OutputMode::TEXT;
   std::string strDatabase;
   std::string strCaps;     // empty: the capability files are not looked at
   std::string strTool;     // empty: to be looked for
@@ -17,4 +17,4 @@ struct OPTIONS {
 };
 
 // Reads the command line. Throws Failure.
-OPTIONS ParseOptions(int argc, char* argv[]);
+CommandLine ParseOptions(int argc, char* argv[]);

@@ -24,8 +24,8 @@ std::string Name(const std::string& strName) {
 }
 
 // "camera 12", with a primary key of several columns "TABLE 'a', 2".
-std::string RowName(const ROW& Row) {
-  const TABLE& Table = Row.Table();
+std::string RowName(const TableRow& Row) {
+  const TableInfo& Table = Row.Table();
   std::string strName = Name(Table.strName) + " ";
   for (size_t Key = 0; Key < Table.Keys.size(); ++Key) {
     strName += (Key == 0 ? "" : ", ") + Shown(Row.Key(Key));
@@ -33,15 +33,15 @@ std::string RowName(const ROW& Row) {
   return strName;
 }
 
-bool IsCamera(const TABLE& Table) { return Table.Vendor != -1 && Table.Model != -1; }
+bool IsCamera(const TableInfo& Table) { return Table.Vendor != -1 && Table.Model != -1; }
 
 std::string Plain(sqlite3_value* pValue) {
   return sqlite3_value_type(pValue) == SQLITE_TEXT ? Escaped(Bytes(pValue)) : Shown(pValue);
 }
 
 // " (VENDOR MODEL)" for a camera.
-std::string CameraName(const ROW& Row) {
-  const TABLE& Table = Row.Table();
+std::string CameraName(const TableRow& Row) {
+  const TableInfo& Table = Row.Table();
   if (!IsCamera(Table)) {
     return "";
   }
@@ -53,7 +53,7 @@ std::string CameraName(const ROW& Row) {
 
 // --- Counts ---
 
-void Tally::Cell(const ROW& Before, const ROW& /*After*/, size_t /*Column*/) {
+void Tally::Cell(const TableRow& Before, const TableRow& /*After*/, size_t /*Column*/) {
   if (!IsCamera(Before.Table())) {
     ++m_OtherCells;
     return;
@@ -65,9 +65,9 @@ void Tally::Cell(const ROW& Before, const ROW& /*After*/, size_t /*Column*/) {
   ++m_CameraCells;
 }
 
-void Tally::Added(const ROW& /*After*/) { ++m_Added; }
+void Tally::Added(const TableRow& /*After*/) { ++m_Added; }
 
-void Tally::Removed(const ROW& /*Before*/) { ++m_Removed; }
+void Tally::Removed(const TableRow& /*Before*/) { ++m_Removed; }
 
 void Tally::NotCompared(const std::string& /*strTable*/, const std::string& /*strWhat*/) {}
 
@@ -77,17 +77,18 @@ bool Tally::IsEmpty() const {
 
 // --- Summary ---
 
-void SummaryReport::Cell(const ROW& /*Before*/, const ROW& /*After*/, size_t /*Column*/) {}
+void SummaryReport::Cell(const TableRow& /*Before*/, const TableRow& /*After*/, size_t /*Column*/) {
+}
 
-void SummaryReport::Added(const ROW& /*After*/) {}
+void SummaryReport::Added(const TableRow& /*After*/) {}
 
-void SummaryReport::Removed(const ROW& /*Before*/) {}
+void SummaryReport::Removed(const TableRow& /*Before*/) {}
 
 void SummaryReport::NotCompared(const std::string& /*strTable*/, const std::string& /*strWhat*/) {}
 
 void SummaryReport::File(const std::string& /*strName*/, const std::string& /*strDiff*/) {}
 
-void SummaryReport::Failed(const FAILED_ACTION& /*Failed*/) {}
+void SummaryReport::Failed(const FailedAction& /*Failed*/) {}
 
 void SummaryReport::Summary(const Tally& Counts) {
   printf("%" PRId64 " cells in %" PRId64 " cameras, %" PRId64 " other cells, %" PRId64
@@ -105,15 +106,15 @@ std::string TextReport::Coloured(const char* szColour, const std::string& strTex
   return m_blColour ? szColour + strText + PLAIN : strText;
 }
 
-void TextReport::Cell(const ROW& Before, const ROW& After, size_t Column) {
+void TextReport::Cell(const TableRow& Before, const TableRow& After, size_t Column) {
   Print(RowName(Before) + CameraName(Before) + " " + Name(Before.Table().Columns[Column].strName) +
         ": " + Coloured(RED, Shown(Before.Column(Column))) + " -> " +
         Coloured(GREEN, Shown(After.Column(Column))) + "\n");
 }
 
-void TextReport::PrintRow(const ROW& Row, const char* szWhat, const char* szColour) const {
+void TextReport::PrintRow(const TableRow& Row, const char* szWhat, const char* szColour) const {
   std::string strText = RowName(Row) + " " + szWhat + ":";
-  const TABLE& Table = Row.Table();
+  const TableInfo& Table = Row.Table();
   for (size_t Column = 0; Column < Table.Columns.size(); ++Column) {
     strText += (Column == 0 ? " " : ", ") + Name(Table.Columns[Column].strName) + "=" +
                Shown(Row.Column(Column));
@@ -121,9 +122,9 @@ void TextReport::PrintRow(const ROW& Row, const char* szWhat, const char* szColo
   Print(Coloured(szColour, strText) + "\n");
 }
 
-void TextReport::Added(const ROW& After) { PrintRow(After, "added", GREEN); }
+void TextReport::Added(const TableRow& After) { PrintRow(After, "added", GREEN); }
 
-void TextReport::Removed(const ROW& Before) { PrintRow(Before, "removed", RED); }
+void TextReport::Removed(const TableRow& Before) { PrintRow(Before, "removed", RED); }
 
 void TextReport::NotCompared(const std::string& strTable, const std::string& strWhat) {
   Print("not compared: " + Name(strTable) + " (" + strWhat + ")\n");
@@ -133,7 +134,7 @@ void TextReport::File(const std::string& /*strName*/, const std::string& strDiff
   Print(strDiff);
 }
 
-void TextReport::Failed(const FAILED_ACTION& Failed) {
+void TextReport::Failed(const FailedAction& Failed) {
   Print(Coloured(RED, "failed: " + Name(Failed.strName) + ": " + Name(Failed.strReason)) + "\n");
 }
 
@@ -151,8 +152,8 @@ void PrintObject(const char* szChange, const std::string& strMembers) {
 }
 
 // The table, and the rowid or an array of the primary key's values.
-std::string JsonRowName(const ROW& Row) {
-  const TABLE& Table = Row.Table();
+std::string JsonRowName(const TableRow& Row) {
+  const TableInfo& Table = Row.Table();
   std::string strKey = Json(Row.Key(0));
   for (size_t Key = 1; Key < Table.Keys.size(); ++Key) {
     strKey += "," + Json(Row.Key(Key));
@@ -161,8 +162,8 @@ std::string JsonRowName(const ROW& Row) {
          JsonMember("row", Table.blHasRowid ? strKey : "[" + strKey + "]");
 }
 
-void PrintJsonRow(const ROW& Row, const char* szChange) {
-  const TABLE& Table = Row.Table();
+void PrintJsonRow(const TableRow& Row, const char* szChange) {
+  const TableInfo& Table = Row.Table();
   std::string strValues;
   for (size_t Column = 0; Column < Table.Columns.size(); ++Column) {
     strValues += (Column == 0 ? "" : ",") + JsonText(Table.Columns[Column].strName) + ":" +
@@ -173,8 +174,8 @@ void PrintJsonRow(const ROW& Row, const char* szChange) {
 
 }  // namespace
 
-void JsonReport::Cell(const ROW& Before, const ROW& After, size_t Column) {
-  const TABLE& Table = Before.Table();
+void JsonReport::Cell(const TableRow& Before, const TableRow& After, size_t Column) {
+  const TableInfo& Table = Before.Table();
   std::string strCamera;
   if (IsCamera(Table)) {
     strCamera = JsonMember("vendor", Json(Before.Column(static_cast<size_t>(Table.Vendor)))) +
@@ -186,9 +187,9 @@ void JsonReport::Cell(const ROW& Before, const ROW& After, size_t Column) {
                           JsonMember("after", Json(After.Column(Column))));
 }
 
-void JsonReport::Added(const ROW& After) { PrintJsonRow(After, "added"); }
+void JsonReport::Added(const TableRow& After) { PrintJsonRow(After, "added"); }
 
-void JsonReport::Removed(const ROW& Before) { PrintJsonRow(Before, "removed"); }
+void JsonReport::Removed(const TableRow& Before) { PrintJsonRow(Before, "removed"); }
 
 void JsonReport::NotCompared(const std::string& strTable, const std::string& strWhat) {
   PrintObject("not compared",
@@ -200,7 +201,7 @@ void JsonReport::File(const std::string& strName, const std::string& strDiff) {
               JsonMember("name", JsonText(strName)) + JsonMember("diff", JsonText(strDiff)));
 }
 
-void JsonReport::Failed(const FAILED_ACTION& Failed) {
+void JsonReport::Failed(const FailedAction& Failed) {
   PrintObject("failed", JsonMember("action", JsonText(Failed.strName)) +
                             JsonMember("reason", JsonText(Failed.strReason)));
 }

@@ -11,9 +11,9 @@
 // Counts what changes.
 class Tally : public ChangeSink {
  public:
-  void Cell(const ROW& Before, const ROW& After, size_t Column) override;
-  void Added(const ROW& After) override;
-  void Removed(const ROW& Before) override;
+  void Cell(const TableRow& Before, const TableRow& After, size_t Column) override;
+  void Added(const TableRow& After) override;
+  void Removed(const TableRow& Before) override;
   void NotCompared(const std::string& strTable, const std::string& strWhat) override;
   bool IsEmpty() const;
 
@@ -34,19 +34,19 @@ class Tally : public ChangeSink {
 class Report : public ChangeSink {
  public:
   virtual void File(const std::string& strName, const std::string& strDiff) = 0;
-  virtual void Failed(const FAILED_ACTION& Failed) = 0;
+  virtual void Failed(const FailedAction& Failed) = 0;
   virtual void Summary(const Tally& Counts) = 0;
 };
 
 // The summary alone, for a person.
 class SummaryReport : public Report {
  public:
-  void Cell(const ROW& Before, const ROW& After, size_t Column) override;
-  void Added(const ROW& After) override;
-  void Removed(const ROW& Before) override;
+  void Cell(const TableRow& Before, const TableRow& After, size_t Column) override;
+  void Added(const TableRow& After) override;
+  void Removed(const TableRow& Before) override;
   void NotCompared(const std::string& strTable, const std::string& strWhat) override;
   void File(const std::string& strName, const std::string& strDiff) override;
-  void Failed(const FAILED_ACTION& Failed) override;
+  void Failed(const FailedAction& Failed) override;
   void Summary(const Tally& Counts) override;
 };
 
@@ -54,15 +54,15 @@ class SummaryReport : public Report {
 class TextReport : public SummaryReport {
  public:
   explicit TextReport(bool blColour) : m_blColour(blColour) {}
-  void Cell(const ROW& Before, const ROW& After, size_t Column) override;
-  void Added(const ROW& After) override;
-  void Removed(const ROW& Before) override;
+  void Cell(const TableRow& Before, const TableRow& After, size_t Column) override;
+  void Added(const TableRow& After) override;
+  void Removed(const TableRow& Before) override;
   void NotCompared(const std::string& strTable, const std::string& strWhat) override;
   void File(const std::string& strName, const std::string& strDiff) override;
-  void Failed(const FAILED_ACTION& Failed) override;
+  void Failed(const FailedAction& Failed) override;
 
  private:
-  void PrintRow(const ROW& Row, const char* szWhat, const char* szColour) const;
+  void PrintRow(const TableRow& Row, const char* szWhat, const char* szColour) const;
   std::string Coloured(const char* szColour, const std::string& strText) const;
 
   const bool m_blColour;
@@ -71,11 +71,11 @@ class TextReport : public SummaryReport {
 // Everything, as JSON Lines: an object a change.
 class JsonReport : public Report {
  public:
-  void Cell(const ROW& Before, const ROW& After, size_t Column) override;
-  void Added(const ROW& After) override;
-  void Removed(const ROW& Before) override;
+  void Cell(const TableRow& Before, const TableRow& After, size_t Column) override;
+  void Added(const TableRow& After) override;
+  void Removed(const TableRow& Before) override;
   void NotCompared(const std::string& strTable, const std::string& strWhat) override;
   void File(const std::string& strName, const std::string& strDiff) override;
-  void Failed(const FAILED_ACTION& Failed) override;
+  void Failed(const FailedAction& Failed) override;
   void Summary(const Tally& Counts) override;
 };

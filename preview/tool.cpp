@@ -129,9 +129,9 @@ std::string Between(const std::string& strText, const char* szBegin, const char*
 }
 
 // The log names the failed actions, in the order in which the executor has sent their reasons.
-std::vector<FAILED_ACTION> FailedActions(const std::string& strLog,
-                                         const std::vector<std::string>& Records) {
-  std::vector<FAILED_ACTION> Failures;
+std::vector<FailedAction> FailedActions(const std::string& strLog,
+                                        const std::vector<std::string>& Records) {
+  std::vector<FailedAction> Failures;
   std::istringstream Log(strLog);
   for (std::string strLine; std::getline(Log, strLine);) {
     const std::string strName = Between(strLine, ":", "(): KiDBExecute command (");
@@ -150,7 +150,7 @@ std::vector<FAILED_ACTION> FailedActions(const std::string& strLog,
 }
 
 // A file that could not be read or replaced: the record has its name, the step and errno.
-void AddFailedFiles(const std::vector<std::string>& Records, std::vector<FAILED_ACTION>* pFailed) {
+void AddFailedFiles(const std::vector<std::string>& Records, std::vector<FailedAction>* pFailed) {
   for (const std::string& strRecord : Records) {
     const std::string strFile = Between(strRecord, "zamoc: [", "]: ");
     const std::string strStep = Between(strRecord, "]: ", " failed with errno [");
@@ -185,17 +185,17 @@ Tool::Tool(const std::string& strTool, const std::string& strOwnProgram,
 
 // Without arguments the tool prints its name and version, and how to call it.
 std::string Tool::Describe() const {
-  const COMMAND_RESULT Result = RunCommand({m_strHelper, m_strTarget, m_strTool});
+  const CommandResult Result = RunCommand({m_strHelper, m_strTarget, m_strTool});
   if (Result.Status != 1) {
     throw Failure("cannot run " + m_strTool + ": " + FirstLine(Result.strOutput));
   }
   return FirstLine(Result.strOutput) + " (" + m_strTool + ")";
 }
 
-UPGRADE Tool::Upgrade(const std::string& strVersion) const {
+UpgradeRun Tool::Upgrade(const std::string& strVersion) const {
   const Descriptor Syslog(BindSyslog(m_strTarget + "/syslog"));
   const Descriptor Openings(WatchOpenings(CapDir()));
-  const COMMAND_RESULT Result =
+  const CommandResult Result =
       RunCommand({m_strHelper, m_strTarget, m_strTool, strVersion}, Syslog.Get());
   if (Result.Status != 0 && Result.Status != FAILED_STATUS) {
     throw Failure("cannot run " + m_strTool + ": " +
@@ -203,7 +203,7 @@ UPGRADE Tool::Upgrade(const std::string& strVersion) const {
                        ? "it was ended by " + std::string(strsignal(Result.Status - 128))
                        : FirstLine(Result.strOutput)));
   }
-  UPGRADE Upgrade;
+  UpgradeRun Upgrade;
   Upgrade.Status = Result.Status;
   const std::string strLog = m_strTarget + "/log/camveld.log";
   Upgrade.Failures = FailedActions(Exists(strLog) ? ReadWholeFile(strLog) : "", Result.Records);

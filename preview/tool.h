@@ -4,15 +4,15 @@
 #include <string>
 #include <vector>
 
-struct FAILED_ACTION {
+struct FailedAction {
   std::string strName;  // of the action, or "capability file NAME"
   std::string strReason;
   bool blFile;
 };
 
-struct UPGRADE {
+struct UpgradeRun {
   int Status = 0;  // 0 or 255
-  std::vector<FAILED_ACTION> Failures;
+  std::vector<FailedAction> Failures;
   int CapActions = 0;  // how many actions have looked at the capability directory
 };
 
@@ -26,7 +26,7 @@ class Tool {
 
   // "tesselupgrader 1.0.0 (FILE)".
   std::string Describe() const;
-  UPGRADE Upgrade(const std::string& strVersion) const;
+  UpgradeRun Upgrade(const std::string& strVersion) const;
   std::string CapDir() const { return m_strTarget + "/@camveld/@KICapInfo"; }
 
  private:

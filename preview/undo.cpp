@@ -30,7 +30,7 @@ constexpr const char* BEGIN_SQL =
     "-- state: 1 set back, 0 as before the upgrade already, NULL changed since\n"
     "CREATE TEMP TABLE tessel_undo (state);\n";
 
-bool IsBookkeeping(const TABLE& Table) { return Table.strName == "sqlite_sequence"; }
+bool IsBookkeeping(const TableInfo& Table) { return Table.strName == "sqlite_sequence"; }
 
 std::string UndoTable(size_t Idx) { return "tessel_undo_" + std::to_string(Idx); }
 
@@ -40,7 +40,7 @@ std::string Holds(const std::string& strColumn, const std::string& strValue) {
          strValue + ")";
 }
 
-std::string HasKeys(const ROW& Row) {
+std::string HasKeys(const TableRow& Row) {
   std::string strSql;
   for (size_t Key = 0; Key < Row.Table().Keys.size(); ++Key) {
     strSql += (Key == 0 ? "" : " AND ") + Quoted(Row.Table().Keys[Key]) + " = " +
@@ -50,7 +50,7 @@ std::string HasKeys(const ROW& Row) {
 }
 
 // Whether the row has all its values.
-std::string HasRow(const ROW& Row) {
+std::string HasRow(const TableRow& Row) {
   std::string strSql = HasKeys(Row);
   for (size_t Column = 0; Column < Row.Table().Columns.size(); ++Column) {
     if (!Row.Table().Columns[Column].blGenerated) {
@@ -61,7 +61,7 @@ std::string HasRow(const ROW& Row) {
   return strSql;
 }
 
-std::string Exists(const ROW& Row, const std::string& strCondition) {
+std::string Exists(const TableRow& Row, const std::string& strCondition) {
   return "EXISTS (SELECT 1 FROM main." + Quoted(Row.Table().strName) + " WHERE " + strCondition +
          ")";
 }
@@ -80,8 +80,8 @@ void UndoScript::Write(const std::string& strText) {
   fwrite(strText.data(), 1, strText.size(), m_pFile.get());
 }
 
-void UndoScript::Cell(const ROW& Before, const ROW& After, size_t Column) {
-  const TABLE& Table = Before.Table();
+void UndoScript::Cell(const TableRow& Before, const TableRow& After, size_t Column) {
+  const TableInfo& Table = Before.Table();
   if (Table.Columns[Column].blGenerated) {
     return;
   }
@@ -105,20 +105,20 @@ void UndoScript::Cell(const ROW& Before, const ROW& After, size_t Column) {
 }
 
 // strDone: that there was nothing to do, because the row is as before the upgrade already.
-void UndoScript::WriteState(const ROW& Row, const std::string& strDone) {
+void UndoScript::WriteState(const TableRow& Row, const std::string& strDone) {
   if (!IsBookkeeping(Row.Table())) {
     Write("INSERT INTO temp.tessel_undo SELECT CASE WHEN changes() THEN 1 WHEN " + strDone +
           " THEN 0 END;\n");
   }
 }
 
-void UndoScript::Added(const ROW& After) {
+void UndoScript::Added(const TableRow& After) {
   Write("DELETE FROM main." + Quoted(After.Table().strName) + " WHERE " + HasRow(After) + ";\n");
   WriteState(After, "NOT " + Exists(After, HasKeys(After)));
 }
 
-void UndoScript::Removed(const ROW& Before) {
-  const TABLE& Table = Before.Table();
+void UndoScript::Removed(const TableRow& Before) {
+  const TableInfo& Table = Before.Table();
   std::string strColumns;
   std::string strValues;
   if (Table.blHasRowid) {
@@ -139,7 +139,7 @@ void UndoScript::Removed(const ROW& Before) {
 void UndoScript::NotCompared(const std::string& /*strTable*/, const std::string& /*strWhat*/) {}
 
 void UndoScript::WriteColumn(size_t Idx, size_t Column) {
-  const TABLE& Table = m_Tables[Idx];
+  const TableInfo& Table = m_Tables[Idx];
   const std::string strUndo = "temp." + UndoTable(Idx) + " AS u";
   const std::string strTable = "main." + Quoted(Table.strName) + " AS t";
   const std::string strColumn = Quoted(Table.Columns[Column].strName);

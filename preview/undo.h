@@ -14,9 +14,9 @@ class UndoScript : public ChangeSink {
  public:
   // Throws Failure, as Close does.
   UndoScript(const std::string& strFile, const std::string& strVersion);
-  void Cell(const ROW& Before, const ROW& After, size_t Column) override;
-  void Added(const ROW& After) override;
-  void Removed(const ROW& Before) override;
+  void Cell(const TableRow& Before, const TableRow& After, size_t Column) override;
+  void Added(const TableRow& After) override;
+  void Removed(const TableRow& Before) override;
   void NotCompared(const std::string& strTable, const std::string& strWhat) override;
   // Writes the end: the cells are set back when all rows are there again.
   void Close();
@@ -24,11 +24,11 @@ class UndoScript : public ChangeSink {
  private:
   void Write(const std::string& strText);
   void WriteColumn(size_t Idx, size_t Column);
-  void WriteState(const ROW& Row, const std::string& strDone);
+  void WriteState(const TableRow& Row, const std::string& strDone);
 
   const std::string m_strFile;
   std::unique_ptr<FILE, int (*)(FILE*)> m_pFile;
-  std::vector<TABLE> m_Tables;               // that cells have changed in
+  std::vector<TableInfo> m_Tables;           // that cells have changed in
   std::vector<std::vector<bool>> m_Columns;  // of each of them, which ones
 };
 
