@@ -1,0 +1,354 @@
+// Shows and changes what the processes of the package log, in the configuration that all of them
+// share.
+
+#include <fcntl.h>
+#include <getopt.h>
+#include <signal.h>
+#include <sys/shm.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdarg>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <numeric>
+#include <string>
+#include <vector>
+
+#include "kidebuglog.h"
+#include "kiflock.h"
+#include "utils.h"
+
+namespace {
+
+constexpr const char* PACKAGE_DIR = "/var/packages/Camveld";
+constexpr const char* SETTINGS_FILE = "/var/packages/Camveld/etc/settings.conf";
+constexpr int LOCK_TIMEOUT_SEC = 5;
+constexpr LOG_LEVEL DEFAULT_LEVEL = LOG_LEVEL_NOTICE;
+
+constexpr char USAGE[] =
+    "Usage: kidbglog [show [--all]]                     what is logged\n"
+    "       kidbglog set CATEGORY[,CATEGORY...] LEVEL   the threshold of categories, or of 'all'\n"
+    "       kidbglog pid PID LEVEL                      the threshold of one process\n"
+    "       kidbglog pid PID clear                      remove it\n"
+    "       kidbglog ms on|off                          times with milliseconds\n"
+    "       kidbglog create                             create and initialise the configuration\n"
+    "       kidbglog load                               read the settings file\n"
+    "       kidbglog save                               write the settings file\n"
+    "A CATEGORY and a LEVEL are a name or a number; show --all lists the categories.\n"
+    "Levels: 0 alarm, 1 error, 2 warn, 3 notice, 4 info, 5 debug, 6 debug2, 7 debug3.\n";
+
+// The exit status, beside 0.
+enum STATUS : int { REFUSED = 1, MISUSED = 2 };
+
+// Says in one line what is wrong, and ends the program.
+[[noreturn]] __attribute__((format(printf, 2, 3))) void Fail(STATUS Status, const char* szFormat,
+                                                             ...) {
+  fputs("kidbglog: ", stderr);
+  va_list Args;
+  va_start(Args, szFormat);
+  vfprintf(stderr, szFormat, Args);
+  va_end(Args);
+  fputc('\n', stderr);
+  exit(Status);
+}
+
+// --- Names ---
+
+// How many characters must be inserted, deleted or replaced to get from one text to the other.
+size_t EditDistance(const std::string& strFrom, const std::string& strTo) {
+  std::vector<size_t> Row(strTo.size() + 1);
+  std::iota(Row.begin(), Row.end(), 0);
+  for (const char From : strFrom) {
+    size_t Diagonal = Row[0]++;
+    for (size_t To = 0; To < strTo.size(); ++To) {
+      const size_t Replaced = Diagonal + (From == strTo[To] ? 0 : 1);
+      Diagonal = Row[To + 1];
+      Row[To + 1] = std::min({Replaced, Row[To] + 1, Diagonal + 1});
+    }
+  }
+  return Row.back();
+}
+
+// The one of the Total values of T that has the name or the number strText.
+template <typename T>
+T Parse(const char* szKind, const std::string& strText, T Total) {
+  size_t NearestDistance = std::min<size_t>(3, (strText.size() + 1) / 2) + 1;
+  std::string strHint = ", see 'kidbglog --help'";
+  for (int Number = 0; Number < Total; ++Number) {
+    const std::string strName = Enum2String(static_cast<T>(Number));
+    if (strText == strName || strText == itos(Number)) {
+      return static_cast<T>(Number);
+    }
+    const size_t Distance = EditDistance(strText, strName);
+    if (Distance < NearestDistance) {
+      NearestDistance = Distance;
+      strHint = ", the nearest is '" + strName + "'";
+    }
+  }
+  Fail(MISUSED, "no %s '%s'%s", szKind, strText.c_str(), strHint.c_str());
+}
+
+LOG_LEVEL ParseLevel(const std::string& strText) {
+  return Parse("level", strText, LOG_LEVEL_TOTAL);
+}
+
+// Another program may have stored a number that no level has.
+std::string LevelText(LOG_LEVEL Level) {
+  return Level >= 0 && Level < LOG_LEVEL_TOTAL ? Enum2String(Level) : itos(Level);
+}
+
+// --- The configuration and its processes ---
+
+KiDbgLogCfg& Attach() {
+  KiDbgLogCfg* const pCfg = KiShmDbgLogCfgAt();
+  if (pCfg == nullptr) {
+    Fail(REFUSED, "cannot attach the configuration: %s",
+         errno == ENOENT ? "there is none, 'kidbglog create' creates it" : strerror(errno));
+  }
+  shmid_ds Info;
+  if (shmctl(shmget(KiShmDbgLogIPCKey(), 0, 0), IPC_STAT, &Info) != 0) {
+    Fail(REFUSED, "cannot get the segment's size: %s", strerror(errno));
+  }
+  if (Info.shm_segsz < sizeof(KiDbgLogCfg)) {
+    Fail(REFUSED, "the segment has %zu bytes, not %zu", size_t{Info.shm_segsz},
+         sizeof(KiDbgLogCfg));
+  }
+  return *pCfg;
+}
+
+bool HasEntry(const KiDbgLogCfg& Cfg, pid_t Pid) {
+  pid_t Found = 0;
+  LOG_LEVEL Level;
+  for (int Idx = 0; Cfg.GetPidLevel(Idx, Found, Level) == 0; ++Idx) {
+    if (Found == Pid) {
+      return true;
+    }
+  }
+  return false;
+}
+
+bool IsRunning(pid_t Pid) { return Pid > 0 && (kill(Pid, 0) == 0 || errno == EPERM); }
+
+// A process chooses its name freely: bytes that a terminal would obey are replaced.
+std::string ProcessName(pid_t Pid) {
+  char szName[64] = "?";
+  if (FILE* pFile = fopen(("/proc/" + itos(Pid) + "/comm").c_str(), "re")) {
+    szName[fread(szName, 1, sizeof(szName) - 1, pFile)] = '\0';
+    fclose(pFile);
+  }
+  std::string strName = Trim(szName, "\n");
+  for (char& Byte : strName) {
+    Byte = Byte < ' ' || Byte > '~' ? '?' : Byte;
+  }
+  return strName;
+}
+
+// --- The commands ---
+
+using WORDS = std::vector<std::string>;  // what follows the command's name
+
+void Print(bool blAll) {
+  const KiDbgLogCfg& Cfg = Attach();
+  int Shown = 0;
+  for (int Number = 0; Number < LOG_CATEG_TOTAL; ++Number) {
+    const auto Categ = static_cast<LOG_CATEG>(Number);
+    const LOG_LEVEL Level = Cfg.GetLogLevel(Categ);
+    if (blAll || Level != DEFAULT_LEVEL) {
+      printf("category %d (%s): %s\n", Number, Enum2String(Categ), LevelText(Level).c_str());
+      ++Shown;
+    }
+  }
+  if (Shown < LOG_CATEG_TOTAL) {
+    printf("%s categories: %s\n", Shown == 0 ? "all" : "other", Enum2String(DEFAULT_LEVEL));
+  }
+  pid_t Pid = 0;
+  LOG_LEVEL Level;
+  for (int Idx = 0; Cfg.GetPidLevel(Idx, Pid, Level) == 0; ++Idx) {
+    const std::string strName = IsRunning(Pid) ? " (" + ProcessName(Pid) + ")" : ", gone";
+    printf("process %d%s: %s\n", Pid, strName.c_str(), LevelText(Level).c_str());
+  }
+  printf("milliseconds: %s\n", Cfg.LogInMs() ? "on" : "off");
+}
+
+void Show(const WORDS& /*Words*/) { Print(false); }
+
+void ShowAll(const WORDS& /*Words*/) { Print(true); }
+
+void Set(const WORDS& Words) {
+  const LOG_LEVEL Level = ParseLevel(Words[1]);
+  std::vector<LOG_CATEG> Categs;
+  for (int Number = 0; Words[0] == "all" && Number < LOG_CATEG_TOTAL; ++Number) {
+    Categs.push_back(static_cast<LOG_CATEG>(Number));
+  }
+  std::string strRest = Categs.empty() ? Words[0] + "," : "";
+  for (size_t Comma; (Comma = strRest.find(',')) != std::string::npos;) {
+    Categs.push_back(Parse("category", strRest.substr(0, Comma), LOG_CATEG_TOTAL));
+    strRest.erase(0, Comma + 1);
+  }
+  KiDbgLogCfg& Cfg = Attach();
+  for (const LOG_CATEG Categ : Categs) {
+    Cfg.SetLogLevel(Categ, Level);
+  }
+}
+
+void ClearPid(pid_t Pid) {
+  KiDbgLogCfg& Cfg = Attach();
+  if (!HasEntry(Cfg, Pid)) {
+    Fail(REFUSED, "process %d has no threshold of its own", Pid);
+  }
+  Cfg.ClearPid(Pid);
+}
+
+void SetPid(pid_t Pid, LOG_LEVEL Level) {
+  KiDbgLogCfg& Cfg = Attach();
+  if (!IsRunning(Pid)) {
+    Fail(REFUSED, "there is no process %d", Pid);
+  }
+  Cfg.SetPidLevel(Pid, Level);
+  if (!HasEntry(Cfg, Pid)) {
+    Fail(REFUSED, "the table of processes is full, 'kidbglog pid PID clear' makes room");
+  }
+}
+
+void ChangePid(const WORDS& Words) {
+  const auto Pid = static_cast<pid_t>(strtol(Words[0].c_str(), nullptr, 10));
+  if (Pid <= 0 || itos(Pid) != Words[0]) {
+    Fail(MISUSED, "not a process id: '%s'", Words[0].c_str());
+  }
+  if (Words[1] == "clear") {
+    ClearPid(Pid);
+  } else {
+    SetPid(Pid, ParseLevel(Words[1]));
+  }
+}
+
+void SetMs(const WORDS& Words) {
+  if (Words[0] != "on" && Words[0] != "off") {
+    Fail(MISUSED, "milliseconds are on or off, not '%s'", Words[0].c_str());
+  }
+  Attach().SetLogInMs(Words[0] == "on");
+}
+
+void Create(const WORDS& /*Words*/) {
+  int Id = shmget(KiShmDbgLogIPCKey(), 0, 0);
+  if (Id == -1 && errno == ENOENT) {
+    Id = shmget(KiShmDbgLogIPCKey(), sizeof(KiDbgLogCfg), IPC_CREAT | 0666);
+  }
+  shmid_ds Info;
+  if (Id == -1 || shmctl(Id, IPC_STAT, &Info) != 0) {
+    Fail(REFUSED, "cannot create the configuration: %s", strerror(errno));
+  }
+  if (Info.shm_segsz != sizeof(KiDbgLogCfg)) {
+    Fail(REFUSED, "there is a segment of %zu bytes already, not of %zu", size_t{Info.shm_segsz},
+         sizeof(KiDbgLogCfg));
+  }
+  const bool blForAll = (Info.shm_perm.mode & 0777) == 0666;
+  Info.shm_perm.mode = 0666;
+  if (!blForAll && shmctl(Id, IPC_SET, &Info) != 0) {
+    Fail(REFUSED, "cannot open the segment to all processes: %s", strerror(errno));
+  }
+  KiDbgLogCfg& Cfg = Attach();
+  Cfg.Init(KiShmDbgLogIPCKey());
+  // Init does not tell whether it could read the settings. Without the directory there are none.
+  if (Cfg.LoadDbgLogSettings() < 0 && errno != ENOENT) {
+    Fail(REFUSED, "created with the defaults, cannot read %s: %s", SETTINGS_FILE, strerror(errno));
+  }
+}
+
+void Load(const WORDS& /*Words*/) {
+  const int Found = Attach().LoadDbgLogSettings();
+  if (Found <= 0) {
+    Fail(REFUSED, "nothing loaded from %s: %s", SETTINGS_FILE,
+         Found == 0 ? "it holds no saved settings" : strerror(errno));
+  }
+}
+
+void Save(const WORDS& /*Words*/) {
+  if (Attach().SaveDbgLogSettings() != 0) {
+    Fail(REFUSED, "cannot write %s: %s", SETTINGS_FILE, strerror(errno));
+  }
+}
+
+struct COMMAND {
+  const char* szName;
+  size_t Words;
+  void (*pRun)(const WORDS& Words);
+};
+
+constexpr COMMAND rgCommand[] = {
+    {"show", 0, Show}, {"show --all", 0, ShowAll}, {"set", 2, Set},   {"pid", 2, ChangePid},
+    {"ms", 1, SetMs},  {"create", 0, Create},      {"load", 0, Load}, {"save", 0, Save},
+};
+
+const COMMAND& FindCommand(const std::string& strName, const WORDS& Words) {
+  for (const COMMAND& Command : rgCommand) {
+    if (strName == Command.szName && Words.size() == Command.Words) {
+      return Command;
+    }
+    if (strName == Command.szName) {
+      Fail(MISUSED, "wrong arguments for '%s', see 'kidbglog --help'", Command.szName);
+    }
+  }
+  Fail(MISUSED, "no command '%s', see 'kidbglog --help'", strName.c_str());
+}
+
+// Keeps other commands away until the end of the program. The configuration has no lock of its own:
+// of two processes that are added at the same moment, one would be lost. A user who may not open
+// the directory goes without.
+void Lock() {
+  const int Fd = open(PACKAGE_DIR, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  if (Fd != -1 && KiFlock::Lock(Fd, LOCK_TIMEOUT_SEC, true) != 0) {
+    Fail(REFUSED, "cannot lock %s: %s", PACKAGE_DIR, strerror(errno));
+  }
+}
+
+// The library logs why a call failed, which may change errno. Under a configuration that lets
+// nothing through, errno holds the reason.
+void SilenceLibrary() {
+  static KiDbgLogCfg Silent = {};
+  FreeDbgCfg();
+  g_pDbgLogCfg = &Silent;
+}
+
+}  // namespace
+
+int main(int argc, char* argv[]) {
+  static const option rgOption[] = {
+      {"all", no_argument, nullptr, 'a'},
+      {"help", no_argument, nullptr, 'h'},
+      {"version", no_argument, nullptr, 'V'},
+      {},
+  };
+  bool blAll = false;
+  for (int Option; (Option = getopt_long(argc, argv, "", rgOption, nullptr)) != -1;) {
+    switch (Option) {
+      case 'a':
+        blAll = true;
+        break;
+      case 'h':
+        fputs(USAGE, stdout);
+        return 0;
+      case 'V':
+        puts("kidbglog " VERSION);
+        return 0;
+      default:  // getopt_long has said what is wrong
+        return MISUSED;
+    }
+  }
+  WORDS Words(argv + optind, argv + argc);
+  std::string strName = "show";
+  if (!Words.empty()) {
+    strName = Words[0];
+    Words.erase(Words.begin());
+  }
+  const COMMAND& Command = FindCommand(strName + (blAll ? " --all" : ""), Words);
+  SilenceLibrary();
+  Lock();
+  Command.pRun(Words);
+  if (fflush(stdout) != 0) {
+    Fail(REFUSED, "cannot write: %s", strerror(errno));
+  }
+}
