@@ -25,7 +25,6 @@ namespace {
 
 constexpr const char* PACKAGE_DIR = "/var/packages/Camveld";
 constexpr const char* SETTINGS_FILE = "/var/packages/Camveld/etc/settings.conf";
-constexpr int LOCK_TIMEOUT_SEC = 5;
 constexpr LOG_LEVEL DEFAULT_LEVEL = LOG_LEVEL_NOTICE;
 
 constexpr char USAGE[] =
@@ -300,7 +299,7 @@ const COMMAND& FindCommand(const std::string& strName, const WORDS& Words) {
 // the directory goes without.
 void Lock() {
   const int Fd = open(PACKAGE_DIR, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
-  if (Fd != -1 && KiFlock::Lock(Fd, LOCK_TIMEOUT_SEC, true) != 0) {
+  if (Fd != -1 && KiFlock::Lock(Fd, -1, true) != 0) {
     Fail(REFUSED, "cannot lock %s: %s", PACKAGE_DIR, strerror(errno));
   }
 }
