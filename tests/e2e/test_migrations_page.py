@@ -1,0 +1,29 @@
+"""docs/migrations.md names every action of the tool, at its threshold and in its place."""
+
+import re
+import subprocess
+
+from conftest import SOURCE
+
+ROW = re.compile(r"^\| (\d+) \| `(\w+)` \|", re.M)
+
+
+def test_the_page_lists_what_the_tool_runs(appliance):
+    page = (SOURCE / "docs/migrations.md").read_text()
+    cameras, files = (ROW.findall(part) for part in page.split("## Capability files"))
+    tool = appliance.build / "main/tesselupgrader"
+
+    def listed(version):
+        command = appliance.command("tessel-preview", "--tool", tool, "--list", version)
+        return subprocess.run(command, capture_output=True, text=True, check=True).stdout
+
+    def expected(version):
+        lines = [name for threshold, name in cameras if int(threshold) > version]
+        number = sum(int(threshold) > version for threshold, _ in files)
+        if number > 0:
+            lines.append(f"{number} capability-file actions, which log no names")
+        return "".join(line + "\n" for line in lines)
+
+    thresholds = {int(threshold) for threshold, _ in cameras + files}
+    for version in sorted({0} | thresholds | {threshold - 1 for threshold in thresholds}):
+        assert listed(version) == expected(version), f"an upgrade from {version}"
