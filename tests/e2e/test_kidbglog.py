@@ -125,7 +125,8 @@ def test_messages(machine, segment, command, message):
     user = []
     if command.startswith("user "):
         user = ["setpriv", "--reuid=65534", "--clear-groups"]
-        ROOT or pytest.skip("only root can become another user")
+        if not ROOT or machine.appliance.emulator:
+            pytest.skip("takes root, and a user who may read the emulator's script")
     if segment:
         machine.start("python3", "-c", SHMGET.format(*segment.split())).wait()
     ended = machine.kidbglog(command.replace("user ", ""), user)
