@@ -40,11 +40,11 @@ constexpr char USAGE[] =
     "Levels: 0 alarm, 1 error, 2 warn, 3 notice, 4 info, 5 debug, 6 debug2, 7 debug3.\n";
 
 // The exit status, beside 0.
-enum STATUS : int { REFUSED = 1, MISUSED = 2 };
+enum ExitStatus : int { REFUSED = 1, MISUSED = 2 };
 
 // Says in one line what is wrong, and ends the program.
-[[noreturn]] __attribute__((format(printf, 2, 3))) void Fail(STATUS Status, const char* szFormat,
-                                                             ...) {
+[[noreturn]] __attribute__((format(printf, 2, 3))) void Fail(ExitStatus Status,
+                                                             const char* szFormat, ...) {
   fputs("kidbglog: ", stderr);
   va_list Args;
   va_start(Args, szFormat);
@@ -147,7 +147,7 @@ std::string ProcessName(pid_t Pid) {
 
 // --- The commands ---
 
-using WORDS = std::vector<std::string>;  // what follows the command's name
+using WordList = std::vector<std::string>;  // what follows the command's name
 
 void Print(bool blAll) {
   const KiDbgLogCfg& Cfg = Attach();
@@ -172,11 +172,11 @@ void Print(bool blAll) {
   printf("milliseconds: %s\n", Cfg.LogInMs() ? "on" : "off");
 }
 
-void Show(const WORDS& /*Words*/) { Print(false); }
+void Show(const WordList& /*Words*/) { Print(false); }
 
-void ShowAll(const WORDS& /*Words*/) { Print(true); }
+void ShowAll(const WordList& /*Words*/) { Print(true); }
 
-void Set(const WORDS& Words) {
+void Set(const WordList& Words) {
   const LOG_LEVEL Level = ParseLevel(Words[1]);
   std::vector<LOG_CATEG> Categs;
   for (int Number = 0; Words[0] == "all" && Number < LOG_CATEG_TOTAL; ++Number) {
@@ -212,7 +212,7 @@ void SetPid(pid_t Pid, LOG_LEVEL Level) {
   }
 }
 
-void ChangePid(const WORDS& Words) {
+void ChangePid(const WordList& Words) {
   const auto Pid = static_cast<pid_t>(strtol(Words[0].c_str(), nullptr, 10));
   if (Pid <= 0 || itos(Pid) != Words[0]) {
     Fail(MISUSED, "not a process id: '%s'", Words[0].c_str());
@@ -224,14 +224,14 @@ void ChangePid(const WORDS& Words) {
   }
 }
 
-void SetMs(const WORDS& Words) {
+void SetMs(const WordList& Words) {
   if (Words[0] != "on" && Words[0] != "off") {
     Fail(MISUSED, "milliseconds are on or off, not '%s'", Words[0].c_str());
   }
   Attach().SetLogInMs(Words[0] == "on");
 }
 
-void Create(const WORDS& /*Words*/) {
+void Create(const WordList& /*Words*/) {
   int Id = shmget(KiShmDbgLogIPCKey(), 0, 0);
   if (Id == -1 && errno == ENOENT) {
     Id = shmget(KiShmDbgLogIPCKey(), sizeof(KiDbgLogCfg), IPC_CREAT | 0666);
@@ -257,7 +257,7 @@ void Create(const WORDS& /*Words*/) {
   }
 }
 
-void Load(const WORDS& /*Words*/) {
+void Load(const WordList& /*Words*/) {
   const int Found = Attach().LoadDbgLogSettings();
   if (Found <= 0) {
     Fail(REFUSED, "nothing loaded from %s: %s", SETTINGS_FILE,
@@ -265,25 +265,25 @@ void Load(const WORDS& /*Words*/) {
   }
 }
 
-void Save(const WORDS& /*Words*/) {
+void Save(const WordList& /*Words*/) {
   if (Attach().SaveDbgLogSettings() != 0) {
     Fail(REFUSED, "cannot write %s: %s", SETTINGS_FILE, strerror(errno));
   }
 }
 
-struct COMMAND {
+struct CommandRow {
   const char* szName;
   size_t Words;
-  void (*pRun)(const WORDS& Words);
+  void (*pRun)(const WordList& Words);
 };
 
-constexpr COMMAND rgCommand[] = {
+constexpr CommandRow rgCommand[] = {
     {"show", 0, Show}, {"show --all", 0, ShowAll}, {"set", 2, Set},   {"pid", 2, ChangePid},
     {"ms", 1, SetMs},  {"create", 0, Create},      {"load", 0, Load}, {"save", 0, Save},
 };
 
-const COMMAND& FindCommand(const std::string& strName, const WORDS& Words) {
-  for (const COMMAND& Command : rgCommand) {
+const CommandRow& FindCommand(const std::string& strName, const WordList& Words) {
+  for (const CommandRow& Command : rgCommand) {
     if (strName == Command.szName && Words.size() == Command.Words) {
       return Command;
     }
@@ -302,14 +302,6 @@ void Lock() {
   if (Fd != -1 && KiFlock::Lock(Fd, -1, true) != 0) {
     Fail(REFUSED, "cannot lock %s: %s", PACKAGE_DIR, strerror(errno));
   }
-}
-
-// The library logs why a call failed, which may change errno. Under a configuration that lets
-// nothing through, errno holds the reason.
-void SilenceLibrary() {
-  static KiDbgLogCfg Silent = {};
-  FreeDbgCfg();
-  g_pDbgLogCfg = &Silent;
 }
 
 }  // namespace
@@ -337,14 +329,13 @@ int main(int argc, char* argv[]) {
         return MISUSED;
     }
   }
-  WORDS Words(argv + optind, argv + argc);
+  WordList Words(argv + optind, argv + argc);
   std::string strName = "show";
   if (!Words.empty()) {
     strName = Words[0];
     Words.erase(Words.begin());
   }
-  const COMMAND& Command = FindCommand(strName + (blAll ? " --all" : ""), Words);
-  SilenceLibrary();
+  const CommandRow& Command = FindCommand(strName + (blAll ? " --all" : ""), Words);
   Lock();
   Command.pRun(Words);
   if (fflush(stdout) != 0) {

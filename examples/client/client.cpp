@@ -44,8 +44,7 @@ static int Show(const char* szFile) {
   return Read == 1 ? 0 : 1;
 }
 
-// create | log CATEG LEVEL | loop CATEG LEVEL | get FILE KEY | set FILE KEY VALUE | fill FILE |
-// show FILE
+// create | log CATEG LEVEL | get FILE KEY | set FILE KEY VALUE | fill FILE | show FILE
 int main(int /*argc*/, char** argv) {
   const std::string strCommand = argv[1];
   if (strCommand == "fill" || strCommand == "show") {
@@ -57,11 +56,9 @@ int main(int /*argc*/, char** argv) {
     KiShmDbgLogCfgAt()->Init(KiShmDbgLogIPCKey());
     return Id == -1;
   }
-  if (strCommand == "log" || strCommand == "loop") {
-    do {
-      KIDBGLOG(static_cast<LOG_CATEG>(std::stoi(argv[2])),
-               static_cast<LOG_LEVEL>(std::stoi(argv[3])), "x\n");
-    } while (strCommand == "loop" && usleep(10000) == 0);
+  if (strCommand == "log") {
+    KIDBGLOG(static_cast<LOG_CATEG>(std::stoi(argv[2])), static_cast<LOG_LEVEL>(std::stoi(argv[3])),
+             "x\n");
     return 0;
   }
   std::string strVal;

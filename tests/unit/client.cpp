@@ -4,6 +4,7 @@
 #include <fileutils.h>
 #include <kidebuglog.h>
 #include <sys/shm.h>
+#include <unistd.h>
 
 #include <cstdio>
 #include <string>
@@ -28,7 +29,7 @@ static void WriteLines(int Count) {
   }
 }
 
-// create | log CATEG LEVEL | write LINES | get FILE KEY | set FILE KEY VALUE
+// create | log CATEG LEVEL | loop CATEG LEVEL | write LINES | get FILE KEY | set FILE KEY VALUE
 int main(int /*argc*/, char** argv) {
   const std::string strCommand = argv[1];
   PrintAttached();
@@ -37,9 +38,12 @@ int main(int /*argc*/, char** argv) {
     KiShmDbgLogCfgAt()->Init(KiShmDbgLogIPCKey());
     return Id == -1;
   }
-  if (strCommand == "log") {
+  if (strCommand == "log" || strCommand == "loop") {
     const auto Categ = static_cast<LOG_CATEG>(std::stoi(argv[2]));
-    KIDBGLOG(Categ, static_cast<LOG_LEVEL>(std::stoi(argv[3])), "x\n");
+    const auto Level = static_cast<LOG_LEVEL>(std::stoi(argv[3]));
+    do {
+      KIDBGLOG(Categ, Level, "x\n");
+    } while (strCommand == "loop" && usleep(10000) == 0);
     return 0;
   }
   if (strCommand == "write") {
