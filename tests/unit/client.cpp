@@ -22,14 +22,14 @@ __attribute__((destructor(101))) static void AtTheVeryEnd() {
   fflush(stdout);
 }
 
-// "line number, as many zeros as it says"
-static void WriteLines(int Count) {
-  for (int Line = 1; Line <= Count; ++Line) {
-    KiPrintf(KI_LOG, nullptr, nullptr, "f", 1, "Fn", "%d %0*d\n", Line, Line, 0);
+// Lines of a number and some zeros, until the process is killed.
+static void WriteLines() {
+  for (int Line = 1;; ++Line) {
+    KiPrintf(KI_LOG, nullptr, nullptr, "f", 1, "Fn", "%d %0*d\n", Line, Line % 300 + 1, 0);
   }
 }
 
-// create | log CATEG LEVEL | loop CATEG LEVEL | write LINES | get FILE KEY | set FILE KEY VALUE
+// create | log CATEG LEVEL | loop CATEG LEVEL | write | get FILE KEY | set FILE KEY VALUE
 int main(int /*argc*/, char** argv) {
   const std::string strCommand = argv[1];
   PrintAttached();
@@ -47,11 +47,11 @@ int main(int /*argc*/, char** argv) {
     return 0;
   }
   if (strCommand == "write") {
-    const int Count = std::stoi(argv[2]);
-    std::thread Other(WriteLines, Count);
-    WriteLines(Count);
-    Other.join();
-    return 0;
+    static KiDbgLogCfg gCfg = {};
+    gCfg.SetLogInMs(true);
+    g_pDbgLogCfg = &gCfg;
+    const std::thread Other(WriteLines);
+    WriteLines();
   }
   std::string strVal;
   return strCommand == "get" ? KiFileGetVal(argv[2], argv[3], strVal) < 0
