@@ -11,9 +11,10 @@ from collections import Counter
 
 import fault
 import kill
+import power
 from appliance import Appliance, Wrong
 
-SWEEPS = {"kill": kill.Sweep, "fault": fault.Sweep}
+SWEEPS = {"kill": kill.Sweep, "fault": fault.Sweep, "power": power.Sweep}
 CLONE_NEWNS = 0x20000
 ENOUGH = 50  # failed cases
 
