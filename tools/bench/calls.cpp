@@ -13,8 +13,6 @@
 #include <sys/file.h>
 #include <unistd.h>
 
-#include <algorithm>
-#include <boost/algorithm/string/replace.hpp>
 #include <cstring>
 #include <functional>
 #include <map>
@@ -38,28 +36,19 @@ const string LOG_LINE =
     "Nov 24 12:00:00 [12345][utils][error] fileutils.cpp:123:GetKeyVals(): Failed to open file "
     "[/var/packages/Camveld/etc/f] with errno [2]\n";
 
-string Repeat(const string& strPattern) {
+// A text of some 4 KiB.
+const string TEXT = [] {
   string strText;
-  for (int Time = 0; Time < 100; ++Time) {
-    strText += strPattern;
+  for (int Time = 0; Time < 85; ++Time) {
+    strText += "/volume1/Front door & yard/2023-11-14 22:13.mp4?";
   }
   return strText;
-}
-
-const string TEXT = Repeat("/volume1/Front door & yard/2023-11-14 22:13.mp4?");
-const string QUOTES = Repeat("it's a day at sea, it's a quiet one, it's Ann's day");
-constexpr int TEXT_LEN = 4800;
+}();
+const int TEXT_LEN = static_cast<int>(TEXT.size());
 
 string Take(char* szText, void (*Free)(void*)) {
   string strText = szText;
   Free(szText);
-  return strText;
-}
-
-template <typename EDIT>
-string Edited(EDIT Edit) {
-  string strText = QUOTES;
-  Edit(strText);
   return strText;
 }
 
@@ -104,26 +93,12 @@ const struct {
      }},
     {"HttpBase64Encode", [] { return Take(HttpBase64Encode(TEXT.c_str()), free); }, "OpenSSL",
      [] {
-       auto* pOut = static_cast<unsigned char*>(malloc(TEXT_LEN / 3 * 4 + 1));
+       auto* pOut = static_cast<unsigned char*>(malloc(TEXT.size() * 4 / 3 + 4));
        EVP_EncodeBlock(pOut, reinterpret_cast<const unsigned char*>(TEXT.data()), TEXT_LEN);
        return Take(reinterpret_cast<char*>(pOut), free);
      }},
     {"urlEncoding", [] { return urlEncoding(TEXT, ""); }, "libcurl",
      [] { return Take(curl_easy_escape(nullptr, TEXT.data(), TEXT_LEN), curl_free); }},
-    {"ReplaceSubstr",
-     [] { return Edited([](string& strText) { ReplaceSubstr(strText, "'", "''"); }); }, "Boost",
-     [] {
-       return Edited(
-           [](string& strText) { boost::replace_all(strText, string("'"), string("''")); });
-     }},
-    {"StringEraseCharacter",
-     [] { return Edited([](string& strText) { StringEraseCharacter(strText, '\''); }); },
-     "std::remove",
-     [] {
-       return Edited([](string& strText) {
-         strText.erase(std::remove(strText.begin(), strText.end(), '\''), strText.end());
-       });
-     }},
     {"KiFileGetVal",
      [] {
        string strVal;
@@ -163,7 +138,8 @@ const struct {
      }},
 };
 
-void Register(const string& strName, const CALL& Call, const CALL& Other) {
+void Register(string strName, const string& strWay, const CALL& Call, const CALL& Other) {
+  strName.append("/").append(strWay);
   benchmark::RegisterBenchmark(strName.c_str(), [=](benchmark::State& State) {
     if (Call() != Other()) {
       State.SkipWithError("the results differ");
@@ -179,8 +155,8 @@ void Register(const string& strName, const CALL& Call, const CALL& Other) {
 int main(int argc, char** argv) {
   const bool blTimes = argc == 4 && strcmp(argv[1], "--times") == 0;
   for (const auto& [strCall, Ours, strPeer, Theirs] : rgCall) {
-    Register(strCall + "/ours", Ours, Theirs);
-    Register(strCall + "/" + strPeer, Theirs, Ours);
+    Register(strCall, "ours", Ours, Theirs);
+    Register(strCall, strPeer, Theirs, Ours);
     for (int Times = blTimes && strCall == argv[3] ? StrToInt32(argv[2]) : 0; Times > 0; --Times) {
       Ours();
     }

@@ -55,18 +55,16 @@ def plot_calls(ratios):
 
 
 def write(found):
-    (DOCS / "performance.json").write_text(json.dumps(found, indent=1) + "\n")
     ratios = {}
-    for row in filter(lambda row: row.peer, ROWS):
-        if row.workload in found:
+    for row in ROWS:
+        if row.peer and row.workload in found:
             ways = found[row.workload]
             ratios[row] = ways["ours"][row.figure] / ways[row.peer][row.figure]
-        else:
-            print(f"bench: not measured: {row.workload}", file=sys.stderr)
     table = measured_table(ratios)
-    page = (DOCS / "performance.md").read_text()
+    page = DOCS / "performance.md"
     section = re.compile(r"(?<=^## Measured\n\n).*?(?=\n\n## )", re.S | re.M)
-    (DOCS / "performance.md").write_text(section.sub(lambda _: table, page))
+    page.write_text(section.sub(lambda _: table, page.read_text()))
+    (DOCS / "performance.json").write_text(json.dumps(found, indent=1) + "\n")
     plot_upgrades(found)
     plot_calls(ratios)
     print(table)
