@@ -11,7 +11,7 @@ namespace {
 
 constexpr int64_t USEC_PER_SEC = 1000000;
 
-// A signal does not cut it short.
+// Sleeps the whole time, even if signals arrive.
 void Sleep(int64_t usec) {
   timespec Left = {};
   Left.tv_sec = USecToSec(usec);

@@ -3,14 +3,14 @@
 
 #include <map>
 
-// Holds the name of every named value of T, a string literal each. A constructor that fills it is
-// defined for each enumeration that has names, beside the enumeration.
+// Maps the values of T to their names, which are string literals. Each enumeration with names has a
+// specialized constructor, declared next to the enumeration, that fills the map.
 template <typename T>
 class KiEnum2StrMap {
  public:
   KiEnum2StrMap();
 
-  // "unknown" for a value without a name. The text lives as long as the process.
+  // The name of Key, or "unknown" if it has none. The text lives as long as the process.
   const char* operator[](T Key) const {
     const auto It = m_szMap.find(Key);
     return It == m_szMap.end() ? "unknown" : It->second;
@@ -20,8 +20,8 @@ class KiEnum2StrMap {
   std::map<T, const char*> m_szMap;
 };
 
-// The name of Enum, or "unknown". The text lives as long as the process, and the caller does not
-// free it. Any thread may call it, until the process's static objects are destroyed at its exit.
+// The name of Enum, or "unknown". The text lives as long as the process; the caller must not free
+// it. Any thread may call it until the process destroys its static objects at exit.
 template <typename T>
 const char* Enum2String(T Enum) {
   static const KiEnum2StrMap<T> Map;

@@ -64,7 +64,7 @@ int WriteAll(int Fd, const void* pBuf, size_t Len) {
       pNext += Written;
       Len -= static_cast<size_t>(Written);
     } else if (Written == 0) {
-      errno = EIO;  // no progress and no reason: the loop would never end
+      errno = EIO;  // without progress the loop would never end
       return -1;
     } else if (errno != EINTR) {
       return -1;

@@ -1,5 +1,5 @@
-// Operations on files that must not leak, lose errno or end the process, for the library itself and
-// the programs built with it; not installed.
+// File operations that must not leak a descriptor, lose errno or end the process. For the library
+// itself and the programs built with it; not installed.
 #pragma once
 
 #include <cerrno>
@@ -8,7 +8,7 @@
 
 namespace fileops {
 
-// Keeps errno: it has the same value after the object as before it.
+// Saves errno when constructed and restores it when destroyed.
 class ErrnoKeeper {
  public:
   ErrnoKeeper() = default;
@@ -22,10 +22,10 @@ class ErrnoKeeper {
   const int m_Errno = errno;
 };
 
-// Disables cancellation of the calling thread during its lifetime, and restores the state that it
-// found. Every destructor that calls a cancellation point (close, fclose, ...) needs one, because
-// cancellation throws there and so ends the whole process. A request that arrives meanwhile waits
-// for the thread's next cancellation point.
+// Disables cancellation of the calling thread when constructed and restores the previous state when
+// destroyed. Every destructor that calls a cancellation point (close, fclose, ...) needs one,
+// because cancellation throws, and throwing in a destructor ends the whole process. A request that
+// arrives meanwhile waits for the thread's next cancellation point.
 class NoCancel {
  public:
   NoCancel();
@@ -37,7 +37,7 @@ class NoCancel {
   int m_OldState;
 };
 
-// Owns a descriptor, or none (-1).
+// Owns a file descriptor, or none (-1).
 class Descriptor {
  public:
   explicit Descriptor(int Fd) : m_Fd(Fd) {}
@@ -49,28 +49,28 @@ class Descriptor {
 
   int Get() const { return m_Fd; }
 
-  // Closes the descriptor with cancellation disabled. Returns 0, at once when there is none, or -1
-  // with errno. The object owns none afterwards.
+  // Closes the descriptor, if there is one, with cancellation disabled. Returns 0, or -1 with
+  // errno. Afterwards the object owns no descriptor.
   int Close();
 
  private:
   int m_Fd;
 };
 
-// Owns the file of a temporary name: removes it, and keeps errno, unless RenameTo has given it its
-// final name. The owner of its descriptor is another.
+// Owns a temporary file. The destructor removes the file and keeps errno, unless RenameTo has given
+// the file its final name. Does not own the file's descriptor.
 class TmpFile {
  public:
-  // Adopts the file strName, which the caller has created. An empty name stands for no file.
+  // Adopts the file strName, which the caller has created. An empty name means no file.
   explicit TmpFile(std::string strName);
   ~TmpFile();
   TmpFile(const TmpFile&) = delete;
   TmpFile& operator=(const TmpFile&) = delete;
 
-  // Empty when there is no file, or no more.
+  // Empty if there is no file or RenameTo has succeeded.
   const char* Name() const { return m_strName.c_str(); }
 
-  // Moves the file to szFile, in place of the one that is there. Returns 0, or -1 with errno: the
+  // Renames the file to szFile and replaces an existing file. Returns 0, or -1 with errno; the
   // object then still owns the file.
   int RenameTo(const char* szFile);
 
@@ -78,13 +78,14 @@ class TmpFile {
   std::string m_strName;
 };
 
-// Creates the file szName (mode 0600) and opens it for writing. Removes first what has the name
-// already: the caller holds a lock that lets nobody else create it, so a killed process left it
-// behind. Returns the descriptor, which the caller owns, or -1 with errno.
+// Creates the file szName (mode 0600) and opens it for writing. First removes an existing file of
+// that name. The caller must hold a lock that keeps others from creating it, so that only a killed
+// process can have left such a file. Returns the descriptor, which the caller owns, or -1 with
+// errno.
 int CreateAnew(const char* szName);
 
-// Writes all Len bytes at pBuf to Fd, in as many calls as that needs; a signal (EINTR) does not end
-// it. Returns 0, or -1 with errno.
+// Writes all Len bytes at pBuf to Fd, in as many calls as needed. Continues after a signal (EINTR).
+// Returns 0, or -1 with errno.
 int WriteAll(int Fd, const void* pBuf, size_t Len);
 
 }  // namespace fileops

@@ -34,8 +34,8 @@ struct LineBuffer {
   size_t Size = 0;
 };
 
-// Takes a line, without its line feed, apart. Returns -1 with both outputs as they were when it
-// carries no pair.
+// Splits a line, without its line feed, into key and value. Returns 0, or -1 with both outputs
+// unchanged if the line has no '='.
 int ParseKeyVal(std::string_view Line, std::string_view& Key, std::string_view& Val) {
   const size_t Equal = Line.find('=');
   if (Equal == std::string_view::npos) {
@@ -50,11 +50,11 @@ int ParseKeyVal(std::string_view Line, std::string_view& Key, std::string_view& 
   return 0;
 }
 
-// Puts the pairs of szFile into KeyVals, unless their keys are there already, and puts the number
-// of their lines in Match, which is left alone when the file cannot be opened; with a pKeys, only
-// its keys count. Returns 0, or the errno of the open or of a read that failed.
+// Adds the pairs of szFile to KeyVals, except for keys that it has already. Sets Match to the
+// number of lines with a pair, or leaves it unchanged if the file cannot be opened. If pKeys is not
+// null, only its keys count. Returns 0, or the errno of the failed open or read.
 int ReadKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals, int& Match) {
-  char rgBuf[4096];  // outlives the stream, which would else ask the system how large to make one
+  char rgBuf[4096];  // must outlive the stream; saves it asking the system for a size
   const File pFile(fopen(szFile, "re"));
   if (pFile == nullptr) {
     return errno;
@@ -74,14 +74,14 @@ int ReadKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals, int
     if (Line.back() == '\n') {
       Line.remove_suffix(1);
     } else if (feof(pFile.get()) == 0) {
-      break;  // the part of a line before a failed read
+      break;  // the read failed within this line
     }
     if (ParseKeyVal(Line, Key, Val) != 0) {
       continue;
     }
     strKey = Key;
     if (pKeys == nullptr || pKeys->count(strKey) != 0) {
-      KeyVals.try_emplace(KeyVals.end(), strKey, Val);  // at the end if they are in order
+      KeyVals.try_emplace(KeyVals.end(), strKey, Val);  // the end is right if keys ascend
       ++Match;
     }
   }
@@ -89,7 +89,7 @@ int ReadKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals, int
   return feof(pFile.get()) != 0 ? 0 : Errno;
 }
 
-// Adds to KeyVals what it does not hold yet.
+// Adds the pairs of szFile to KeyVals under a shared lock. Returns the number of lines, or -1.
 int GetKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals) {
   KiFlock Lock(szFile);
   if (Lock.LockSh(-1) != 0) {
@@ -106,7 +106,7 @@ int GetKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals) {
   return Match;
 }
 
-// A thread that is cancelled half-way through a change would leave a temporary file and a lock.
+// Cancelling a thread in the middle of a change would leave a temporary file and a lock.
 class CancelDisabler {
  public:
   CancelDisabler() { pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, nullptr); }
@@ -135,7 +135,7 @@ int WriteToFile(const char* szFile, const KeyValMap& KeyVals, bool blQuoteVal) {
     strText.append(strKey).append("=").append(szQuote).append(strVal).append(szQuote).append("\n");
   }
   if (WriteText(szFile, strText) != 0) {
-    // "wrtie": others search for this text
+    // keep "wrtie": others search for this text
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to wrtie file [%s] with errno [%d].\n",
              szFile, errno);
     return -1;
@@ -172,7 +172,7 @@ int WriteToFileAtomic(const char* szFile, const KeyValMap& KeyVals, bool blQuote
   return 0;
 }
 
-// Whoever held the lock before may have replaced the file that it was waited for on.
+// Locks again if the previous holder of the lock has replaced the file.
 int LockCurrent(KiFlock& Lock) {
   while (Lock.LockEx(-1) == 0) {
     if (Lock.IsCurrent()) {
@@ -199,7 +199,7 @@ int UpdateKeyVals(const char* szFile, const KeyValMap& AddKeyVals, const KeySet&
   int Match = 0;
   const int Errno = ReadKeyVals(szFile, nullptr, KeyVals, Match);
   if (Errno != 0) {
-    // After a failed read too: what was read so far must not become the whole file.
+    // A failed read ends here too: what was read so far must not become the whole file.
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to open file [%s] with errno [%d]\n", szFile,
              Errno);
     return -1;

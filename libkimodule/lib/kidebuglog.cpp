@@ -65,8 +65,8 @@ bool LogInMs() {
   return pCfg != nullptr && pCfg->LogInMs();
 }
 
-// Fills the FIELD_SIZE bytes of szTime, or leaves them empty when the clock cannot be converted.
-// The month has its English name in every locale.
+// Writes the local time to szTime (FIELD_SIZE bytes), or leaves it unchanged if the clock cannot be
+// converted. The month has its English name in every locale. Returns szTime.
 const char* KiGetPresentTime(char* szTime) {
   static const char* const rgFormat[] = {"Jan %e %T", "Feb %e %T", "Mar %e %T", "Apr %e %T",
                                          "May %e %T", "Jun %e %T", "Jul %e %T", "Aug %e %T",
@@ -89,7 +89,7 @@ void ReportLostLine(int LineNo, const char* szStep) {
          szStep, errno);
 }
 
-// Opens and locks the log file, or reports why it cannot and returns -1.
+// Opens and locks the log file. Returns its descriptor, or -1 after reporting the reason.
 int OpenLog(LOG_TYPE LogType) {
   const char* szPath = KiGetLogFilePath(LogType);
   if (szPath == nullptr) {
@@ -118,7 +118,7 @@ struct LinePrefix {
   char szCategLevel[FIELD_SIZE] = "";
 };
 
-// To be called under the lock, so that the lines of a file stand in the order of their times.
+// Call with the lock held: the lines of a file must be in the order of their times.
 void FillPrefix(LinePrefix* pPrefix, const char* szCateg, const char* szLevel) {
   const pid_t Pid = getpid();
   const pid_t Tid = gettid();
@@ -133,9 +133,9 @@ void FillPrefix(LinePrefix* pPrefix, const char* szCateg, const char* szLevel) {
   }
 }
 
-// Writes one line, whose message is formatted with the caller's errno (%m), and keeps that errno.
-// To be called with thread cancellation disabled. A line of usual length takes no memory and one
-// write; only a longer one, or one that is in part beyond printf, is worth a stream.
+// Writes one line and keeps the caller's errno, which "%m" in the message gives. Call with thread
+// cancellation disabled. A line of usual length needs no heap and one write. A longer line, or one
+// that snprintf cannot format completely, is written through a stream.
 __attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const char* szCateg,
                                                      const char* szLevel, const char* szFile,
                                                      int LineNo, const char* szFunc,
@@ -156,13 +156,13 @@ __attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const cha
     va_list Copy;
     va_copy(Copy, Args);
     errno = Errno.Get();
-    // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): the analyzer does not know the caller's
+    // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): the caller called va_start
     const int MessageLen = vsnprintf(szLine + Len, LINE_SIZE - Len, szFormat, Copy);
     va_end(Copy);
     Len = MessageLen < 0 ? LINE_SIZE : Len + static_cast<size_t>(MessageLen);
   }
   if (Len < LINE_SIZE) {
-    fileops::WriteAll(Fd, szLine, Len);  // a full disk has nobody to tell
+    fileops::WriteAll(Fd, szLine, Len);  // deliberately not reported: a full disk
     KiFlock::UnLock(Fd);
     close(Fd);
   } else if (FILE* pStream = fdopen(Fd, "a")) {
@@ -208,7 +208,7 @@ void KiDbgPrintf(LOG_CATEG Categ, LOG_LEVEL Level, const char* szFile, int LineN
 namespace {
 
 constexpr const char* SETTINGS_FILE = "/var/packages/Camveld/etc/settings.conf";
-constexpr const char* LEVELS_KEY = "ki_dbglog_settings";  // by category, parted by commas
+constexpr const char* LEVELS_KEY = "ki_dbglog_settings";  // by category, separated by commas
 constexpr const char* IN_MS_KEY = "ki_dbglog_time_scale";
 
 }  // namespace
@@ -299,15 +299,15 @@ void KiDbgLogCfg::ClearPid(pid_t Pid) {
   SetUsedPids(Count - 1);
 }
 
-// The count comes from other processes: it is never followed outside the table.
+// Other processes write the count, so limit it to the table.
 int KiDbgLogCfg::UsedPids() const {
   return std::clamp(__atomic_load_n(&m_PidCnt, __ATOMIC_ACQUIRE), 0, MAX_PIDS);
 }
 
-// Whoever sees the new count sees the entries that it covers.
+// A reader that sees the new count also sees the entries that it covers.
 void KiDbgLogCfg::SetUsedPids(int Count) { __atomic_store_n(&m_PidCnt, Count, __ATOMIC_RELEASE); }
 
-// The first of Count entries that is Pid's, or -1.
+// The index of the first of Count entries that is Pid's, or -1.
 int KiDbgLogCfg::FindPid(pid_t Pid, int Count) const {
   for (int Idx = 0; Idx < Count; ++Idx) {
     if (Load(m_PidLevels[Idx].Pid) == Pid) {

@@ -1,4 +1,5 @@
-// Attaches the configuration. Compiled for each form of the library, unlike its other sources.
+// Attaches the configuration. The static and the shared library each compile this file; they share
+// the objects of all other sources.
 #include "kidebuglog.h"
 #include "utils.h"
 
@@ -8,10 +9,10 @@ void InitDbgCfg() { g_pDbgLogCfg = KiShmDbgLogCfgAt(); }
 
 void FreeDbgCfg() { ShmDt(g_pDbgLogCfg); }
 
-// The linker places the objects of a static library behind the program's own, so these hooks run
-// when the program's global objects are constructed. It takes this object into every program that
-// uses the log, which needs g_pDbgLogCfg. The hooks of a shared library would run too early: there
-// the program itself contains kidebuglog_start.cpp.
+// The linker places the objects of a static library after the program's own, so AtStart runs after
+// the constructors of the program's global objects. It links this object into every program that
+// uses the log, because the log needs g_pDbgLogCfg. The hooks of a shared library would run too
+// early, so the program itself contains kidebuglog_start.cpp instead.
 #ifndef KIMODULE_SHARED
 __attribute__((constructor)) static void AtStart() { InitDbgCfg(); }
 __attribute__((destructor)) static void AtExit() { FreeDbgCfg(); }

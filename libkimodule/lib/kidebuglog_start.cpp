@@ -1,5 +1,6 @@
-// The start-up and exit hooks for programs that use the shared library. Linked into the program
-// itself, behind its own objects: a shared library's constructors would run before the program's.
+// The start-up and exit hooks of programs that use the shared library. Linked into the program
+// itself, after its own objects, because a shared library's constructors would run before the
+// program's.
 #include "kidebuglog.h"
 
 __attribute__((constructor)) static void AtStart() { InitDbgCfg(); }

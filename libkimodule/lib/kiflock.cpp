@@ -37,7 +37,7 @@ void KiFlock::UnLock() {
   if (m_Fd < 0) {
     return;
   }
-  const fileops::NoCancel Guard;  // the destructor ends here too
+  const fileops::NoCancel Guard;  // the destructor calls this too
   UnLock(m_Fd);
   close(m_Fd);
   m_Fd = -1;

@@ -1,5 +1,4 @@
-// The one reading of decimal numbers, for the library itself and the programs built with it; not
-// installed.
+// Reads decimal numbers. For the library itself and the programs built with it; not installed.
 #pragma once
 
 #include <algorithm>
@@ -7,8 +6,8 @@
 #include <cstdlib>
 #include <limits>
 
-// The number that szText begins with, as strtol reads it, or 0; beyond the 32-bit range the range's
-// nearest end, whatever the size of long.
+// The decimal number at the start of szText, as strtol reads it, or 0 if there is none. A number
+// outside the 32-bit range gives the nearest limit of that range, whatever the size of long.
 inline int32_t StrToInt32(const char* szText) {
   constexpr long MIN = std::numeric_limits<int32_t>::min();
   constexpr long MAX = std::numeric_limits<int32_t>::max();

@@ -137,7 +137,7 @@ char* HttpBase64Encode(const char* src) {
   char* pOut = szText;
   for (size_t Done = 0; Done < Len; Done += 3) {
     const unsigned First = pIn[Done];
-    const unsigned Second = pIn[Done + 1];  // the terminating 0 where the text ends
+    const unsigned Second = pIn[Done + 1];  // the terminating 0 at the end of the text
     const unsigned Third = Done + 1 < Len ? pIn[Done + 2] : 0;
     *pOut++ = szAlphabet[First >> 2];
     *pOut++ = szAlphabet[(First & 3) << 4 | Second >> 4];
