@@ -6,7 +6,7 @@ namespace {
 
 constexpr const char* BLANKS = " \t";
 
-// Takes the first line, with its line feed, off a text that is not empty.
+// Removes the first line, with its line feed, from *pText, which must not be empty, and returns it.
 std::string_view TakeLine(std::string_view* pText) {
   const size_t Feed = pText->find('\n');
   const std::string_view Line = pText->substr(0, Feed == std::string_view::npos ? Feed : Feed + 1);
@@ -22,7 +22,7 @@ std::string_view TrimBlanks(std::string_view Text) {
   return Text.substr(First, Text.find_last_not_of(BLANKS) - First + 1);
 }
 
-// The key of a line, empty when it has none.
+// The key of a line; empty if it has none.
 std::string_view KeyOf(std::string_view Line) {
   const size_t Equals = Line.find('=');
   if (Equals == std::string_view::npos || Line[0] == '#') {
@@ -49,7 +49,7 @@ std::string_view ValueOf(std::string_view Line) {
 namespace caplines {
 
 bool FindKey(std::string_view Text, std::string_view Key, std::string_view* pValue) {
-  // Only lines that contain the key are looked at.
+  // Look only at lines that contain the key.
   size_t Pos = Key.empty() ? std::string_view::npos : Text.find(Key);
   while (Pos != std::string_view::npos) {
     Text.remove_prefix(Text.rfind('\n', Pos) + 1);

@@ -1,5 +1,5 @@
-// The lines of a capability file, as text: nothing here opens a file. A line keeps its line feed
-// and may hold any bytes; zamoc.h says what is a key and what a value.
+// Finds and changes lines in the text of a capability file; opens no file. A line includes its line
+// feed and may contain any bytes. zamoc.h defines key and value.
 #pragma once
 
 #include <string>
@@ -8,21 +8,24 @@
 
 namespace caplines {
 
-// Whether there is a line of that key; *pValue is then the value of the first, a part of Text.
+// Returns true if Text has a line of that key. *pValue is then the value of the first such line, as
+// a part of Text.
 bool FindKey(std::string_view Text, std::string_view Key, std::string_view* pValue);
 
-// Fills the two "%s" of strFormat with key and value. Returns nothing when it has not exactly two,
-// or when they do not make one line, closed by a line feed, of that key.
+// Replaces the first "%s" of strFormat with the key and the second with the value. Returns an empty
+// string if strFormat does not have exactly two '%', both in "%s", or if the result is not one line
+// of that key that ends in a line feed.
 std::string FormatLine(const std::string& strFormat, const std::string& strKey,
                        const std::string& strValue);
 
 struct Change {
   std::string strKey;
-  std::string strNewLine;  // empty: the key is taken out
+  std::string strNewLine;  // empty: remove the key
 };
 
-// Returns Text with changes of different keys made. The new line of a key replaces its first line,
-// or is appended when it has none; all other lines of that key are dropped.
+// Returns Text with the changes made; their keys must differ. The new line of a key replaces its
+// first line, or is appended if the key has none. Repeated lines of a key are dropped, whether the
+// key is set or removed.
 std::string ChangeLines(std::string_view Text, const std::vector<Change>& Changes);
 
 }  // namespace caplines

@@ -33,20 +33,20 @@ constexpr const char* TMP_NAME = "/.zamoc.tmp";
 
 enum class ReadResult {
   Read,
-  NoCapabilityFile,  // its name leads to nothing that may hold keys
+  NoCapabilityFile,  // the file cannot be a capability file; no failure
   OpenFailed,
   ReadFailed,
 };
 
-// What a killed process left behind is nobody's capability file: the next change in its directory
-// removes it.
+// True for a temporary file of this library, which is never a capability file. A killed process may
+// leave one; the next change in its directory removes it.
 bool IsTmpFile(const std::string& strFile) {
   const std::string strEnd = TMP_NAME;
   return strFile.size() >= strEnd.size() &&
          strFile.compare(strFile.size() - strEnd.size(), strEnd.size(), strEnd) == 0;
 }
 
-// 0 when it can be a capability file, else -1 with errno.
+// Returns 0 if the file can be a capability file, else -1 with errno.
 int CheckFile(const struct stat& Stat) {
   if (!S_ISREG(Stat.st_mode)) {
     errno = EINVAL;
@@ -59,8 +59,9 @@ int CheckFile(const struct stat& Stat) {
   return 0;
 }
 
-// Opening anything but a regular file could hang (a FIFO) or have effects (a device), so it is
-// looked at first. Returns a descriptor and the file's size, or -1 with errno.
+// Checks the file before opening it, because opening a FIFO could hang and opening a device could
+// have side effects. Returns a descriptor and sets *pSize to the file's size, or returns -1 with
+// errno.
 int OpenCapabilityFile(const std::string& strFile, size_t* pSize) {
   if (IsTmpFile(strFile)) {
     errno = EINVAL;
@@ -74,11 +75,11 @@ int OpenCapabilityFile(const std::string& strFile, size_t* pSize) {
   return open(strFile.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
 }
 
-// Reads a file of about Size bytes to its end. Returns 0, or -1 with errno, also when it grows too
-// large.
+// Reads a file to its end. Size is its expected size. Returns 0, or -1 with errno; a file that has
+// grown too large gives EFBIG.
 int ReadAll(int Fd, size_t Size, std::string* pText) {
   size_t Len = 0;
-  pText->resize(Size + 1);  // a byte more, to see the end by the same read
+  pText->resize(Size + 1);  // one more byte, so that one read shows the end too
   for (;;) {
     const ssize_t Count = read(Fd, pText->data() + Len, pText->size() - Len);
     if (Count == -1) {
@@ -99,8 +100,8 @@ int ReadAll(int Fd, size_t Size, std::string* pText) {
   }
 }
 
-// Reads a capability file's text and, unless pStat is null, the status of what was opened. Unless
-// the result is Read, errno says why, and the text is of no use.
+// Reads the text of a capability file and, if pStat is not null, the status of the opened file. If
+// the result is not Read, errno gives the reason, and the text is not usable.
 ReadResult ReadFile(const std::string& strFile, std::string* pText, struct stat* pStat) {
   size_t Size = 0;
   const fileops::Descriptor File(OpenCapabilityFile(strFile, &Size));
@@ -134,8 +135,8 @@ int SetOwnerAndMode(int Fd, const struct stat& Stat) {
   return fchmod(Fd, Stat.st_mode & 07777);
 }
 
-// Replaces strFile in the directory behind DirFd by its changed copy. The order makes it
-// hold through a power cut: the content is on stable storage before it gets its name.
+// Replaces strFile with a changed copy. DirFd is its open directory. The copy is on stable storage
+// before it gets the file's name, so that a power cut leaves the old content or the new.
 int ReplaceFile(const std::string& strFile, const std::string& strDir, int DirFd,
                 const std::vector<Change>& Changes) {
   std::string strText;
@@ -163,7 +164,7 @@ int ReplaceFile(const std::string& strFile, const std::string& strDir, int DirFd
   if (NewName.RenameTo(strFile.c_str()) != 0) {
     return ReportFailure(strFile, "rename");
   }
-  // Some file systems cannot sync a directory, and say so; that is no failure.
+  // EINVAL: this file system cannot sync a directory. That is no failure.
   if (fsync(DirFd) != 0 && errno != EINVAL) {
     return ReportFailure(strFile, "fsync of the directory");
   }
@@ -178,7 +179,7 @@ bool IsLink(const char* szFile) {
 int ChangeFile(const char* szFile, const std::vector<Change>& Changes) {
   std::string strReal = szFile;
   if (strReal.find('/') == std::string::npos || IsLink(szFile)) {
-    // A link stays: the file it leads to is the one that is replaced.
+    // Keep a symbolic link and replace the file that it leads to.
     const std::unique_ptr<char, decltype(&free)> pReal(realpath(szFile, nullptr), free);
     if (pReal == nullptr) {
       return ReportFailure(szFile, "realpath");
@@ -190,7 +191,7 @@ int ChangeFile(const char* szFile, const std::vector<Change>& Changes) {
   if (Dir.Get() == -1) {
     return ReportFailure(szFile, "open of the directory");
   }
-  // Two changes made at once must not undo each other.
+  // Concurrent changes must not undo each other.
   if (KiFlock::Lock(Dir.Get(), DIR_LOCK_TIMEOUT_SEC, true) != 0) {
     return ReportFailure(szFile, "lock of the directory");
   }

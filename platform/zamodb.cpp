@@ -15,7 +15,7 @@
 struct DBConnect_tag {
   sqlite3* m_pDb = nullptr;
 
-  // Finishes nothing: a transaction that is still open is rolled back.
+  // Closing the connection rolls back any open transaction.
   ~DBConnect_tag() {
     const fileops::NoCancel Guard;
     sqlite3_close(m_pDb);
@@ -31,19 +31,19 @@ struct DBResult_tag {
 namespace {
 
 constexpr int BUSY_TIMEOUT_MSEC = 5000;
-// What one statement may have to take back is kept in memory up to this size. It is the most that
-// SQLite can move to a temporary file then, in one write of at most 128 KiB. Beyond it, which takes
-// some hundred cameras that one text changes twice, there must be a directory for such files.
+// Up to this size, SQLite keeps in memory what it needs to roll back one statement. Beyond this
+// size, it moves the data to a temporary file, in one write of at most 128 KiB, so a larger limit
+// would not work. Only a text that changes some hundred cameras twice goes beyond it; a directory
+// for temporary files must then exist.
 constexpr int STATEMENT_JOURNAL_BYTES = 31 * 4096;
 
-// In KiB. What was only read takes little room, which the processor's cache holds; what a
-// transaction changes has SQLite's usual room, for writing it early would cost another sync each
-// time.
+// In KiB. Pages that were only read get little memory, so that it fits into the processor's cache.
+// Changed pages get SQLite's usual amount, because each write before the commit costs another sync.
 constexpr const char* CACHE_SETTINGS = "PRAGMA cache_size = -128; PRAGMA cache_spill = -2000";
 
 struct StatementFinalizer {
   void operator()(sqlite3_stmt* pStatement) const {
-    const fileops::NoCancel Guard;  // it may end a transaction, and so write
+    const fileops::NoCancel Guard;  // finalizing may end a transaction, and so write
     sqlite3_finalize(pStatement);
   }
 };
@@ -59,15 +59,14 @@ void ReportFailure(sqlite3* pDb, const char* szDBName, const char* szReason) {
          sqlite3_extended_errcode(pDb));
 }
 
-// Sets what holds for all connections. Fails, and does no harm, where the process has used SQLite
-// before.
+// Configures SQLite for all connections. Fails without harm if the process has used SQLite before.
 bool ConfigureSqlite() {
   return sqlite3_config(SQLITE_CONFIG_STMTJRNL_SPILL, STATEMENT_JOURNAL_BYTES) == SQLITE_OK &&
-         // Nobody asks for statistics, which cost a lock at every allocation.
+         // No memory statistics: nobody reads them, and they cost a lock at every allocation.
          sqlite3_config(SQLITE_CONFIG_MEMSTATUS, 0) == SQLITE_OK;
 }
 
-// Copies the statement's current row; false when memory runs out.
+// Appends the statement's current row to *pResult. Returns false if memory runs out.
 bool CopyRow(sqlite3_stmt* pStatement, DBResult* pResult) {
   std::vector<std::optional<std::string>> Row(pResult->m_Columns.size());
   for (int Column = 0; Column < static_cast<int>(Row.size()); ++Column) {
@@ -86,7 +85,7 @@ bool CopyRow(sqlite3_stmt* pStatement, DBResult* pResult) {
   return true;
 }
 
-// Runs one statement to its end; a statement that yields columns replaces *ppResult.
+// Runs one statement to its end. If it returns columns, its result set replaces *ppResult.
 int RunStatement(sqlite3_stmt* pStatement, std::unique_ptr<DBResult>* ppResult) {
   const int Columns = sqlite3_column_count(pStatement);
   if (Columns > 0) {
@@ -129,7 +128,7 @@ int RunText(sqlite3* pDb, const char* szSqlCmd, std::unique_ptr<DBResult>* ppRes
 
 DBConnect* ZAMODBConnect(const char* /*szHost*/, const char* /*szUser*/, const char* /*szPassword*/,
                          const char* szDBName) {
-  // SQLite would take an empty name for a temporary database and ":memory:" for one in memory.
+  // SQLite would open a temporary database for an empty name and one in memory for ":memory:".
   if (szDBName == nullptr || !IsRegularFile(szDBName)) {
     return nullptr;
   }
@@ -144,7 +143,7 @@ DBConnect* ZAMODBConnect(const char* /*szHost*/, const char* /*szUser*/, const c
     ReportFailure(pConn->m_pDb, szDBName, "the file cannot be written");
     return nullptr;
   }
-  // Without waiting for a lock, and whatever comes of it: the text runs all the same.
+  // Do not wait for a lock here, and ignore a failure: the text runs without these settings too.
   sqlite3_exec(pConn->m_pDb, CACHE_SETTINGS, nullptr, nullptr, nullptr);
   sqlite3_busy_timeout(pConn->m_pDb, BUSY_TIMEOUT_MSEC);
   return pConn.release();
@@ -159,10 +158,10 @@ int ZAMODBExecute(DBConnect* pConn, const char* szSqlCmd, DBResult** ppResult) {
   const char* szReason = nullptr;
   const int Run = RunText(pDb, szSqlCmd, &pResult);
   if (Run != SQLITE_OK) {
-    // Out of memory may be this layer's own, which SQLite's message would not show.
+    // This layer may itself run out of memory, which SQLite's message would not show.
     szReason = Run == SQLITE_NOMEM ? sqlite3_errstr(Run) : sqlite3_errmsg(pDb);
   } else if (sqlite3_get_autocommit(pDb) == 0) {
-    // Closing would roll it back: success would promise rows that are not there.
+    // Closing would roll the transaction back, so its changes would be lost without an error.
     szReason = "the text leaves a transaction open";
   }
   if (szReason != nullptr) {
