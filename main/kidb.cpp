@@ -13,7 +13,7 @@ std::mutex gDBMutex[KiDB::DBI_CNT];
 
 namespace KiDB {
 
-// An unknown instance leaves both as they are.
+// Leaves both outputs unchanged if the instance is unknown.
 static void GetDBInfo(DB_INSTANCE DBInstance, std::string& strDBName, int& MutexIdx) {
   switch (DBInstance) {
     case DBI_SYSTEM:
@@ -34,7 +34,7 @@ static void ReplaceBoolForSqlite(std::string& strCmd) {
       {"false", "0"}, {"FALSE", "0"}, {"true", "1"}, {"TRUE", "1"}};
   bool blReplaced = false;
   for (const auto& [strWord, strDigit] : BoolStrMap) {
-    // A digit never makes a new word, so the search can go on where it stands.
+    // Continue at the replacement: a digit cannot be part of another word.
     size_t Pos = strCmd.find(strWord);
     while (Pos != std::string::npos) {
       strCmd.replace(Pos, strWord.size(), strDigit);
@@ -49,7 +49,7 @@ static void ReplaceBoolForSqlite(std::string& strCmd) {
 }
 
 static DBConnect* KiDBConnect(const std::string& strDBName) {
-  // ignored, but always passed
+  // The user name is ignored, but callers always pass this one.
   return ZAMODBConnect(nullptr, "postgres", nullptr, strDBName.c_str());
 }
 

@@ -1,4 +1,4 @@
-// Runs SQL texts against the package's databases.
+// Runs SQL commands on the package's databases.
 #pragma once
 
 #include <string>
@@ -10,23 +10,23 @@ namespace KiDB {
 typedef enum __DB_INSTANCE : int {
   DBI_SYSTEM = 0,     // /var/packages/Camveld/target/system.db
   DBI_RECORDING = 1,  // /var/services/camveld/recording.db
-  DBI_CNT = 2,        // how many there are, not a database
+  DBI_CNT = 2,        // number of databases
 } DB_INSTANCE;
 
-// Connects to a database, runs strCommand between "BEGIN;" and ";COMMIT;", and closes. Returns 0,
-// or -1 after logging why: no connection, or a statement failed, and then nothing of the text is
-// committed.
+// Opens the database, runs strCommand between "BEGIN;" and ";COMMIT;", and closes the database.
+// Returns 0. If the database cannot be opened or a statement fails, logs the failure, commits
+// nothing and returns -1.
 //
-// With a non-null ppResult the result set of a successful query is stored in *ppResult; the caller
-// releases it with KiDBFreeResult. *ppResult is left as it was when there is none: set it to null
-// first. With blReplaceBoolForSqlite every "true", "TRUE", "false" and "FALSE" of the text, inside
-// names and quotes too, is run as 1 or 0.
+// If a query succeeds and ppResult is not null, *ppResult receives the result set, which the caller
+// releases with KiDBFreeResult. If there is no result set, *ppResult is unchanged: set it to null
+// before the call. If blReplaceBoolForSqlite is true, every "true", "TRUE", "false" and "FALSE" in
+// strCommand, even inside names and quotes, is replaced by 1 or 0.
 //
-// Any thread may call it; calls for one database take turns.
+// Any thread may call it. Calls for the same database run one after another.
 int Execute(DB_INSTANCE DBInstance, std::string strCommand, DBResult_tag** ppResult,
             bool blReplaceBoolForSqlite);
 
-// Releases a result set that Execute handed back; null is allowed.
+// Releases a result set that Execute returned. Null is allowed.
 void KiDBFreeResult(DBResult_tag* pResult);
 
 }  // namespace KiDB

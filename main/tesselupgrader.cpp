@@ -1,10 +1,10 @@
-// Brings the recorder's camera rows and capability files in line with a newly installed Tessel
-// package: runs every migration action whose version threshold lies above the version number of the
-// package that was installed before.
+// Upgrades the recorder's camera rows and capability files for a newly installed Tessel package:
+// runs every migration action whose version threshold is above the version of the package that was
+// installed before.
 //
-// First what the actions share, then the actions on camera rows and those on capability files, each
-// kind in the order of its table, then the two tables, and last main() with what walks a table.
-// A new action goes to the end of its kind, and to its table by ascending threshold.
+// Contents: helpers of the actions, actions on camera rows, actions on capability files, the two
+// action tables, main(). The actions of each kind have the order of their table. Add a new action
+// at the end of its kind, and to its table by ascending threshold.
 
 #include <dirent.h>
 #include <malloc.h>
@@ -26,22 +26,22 @@
 #include "utils.h"
 #include "zamoc.h"
 
-// One row of an action table: the action runs when the version before the upgrade is below
-// orgVersion, or always when orgVersion is 0. A null pFuncUpdate ends the table.
+// One row of an action table. The action runs if the version before the upgrade is below
+// orgVersion, or always if orgVersion is 0. A null pFuncUpdate ends the table.
 typedef struct _camveld_upgrader_ {
   uint32_t orgVersion;
   int32_t (*pFuncUpdate)();
 } UPD_LIST;
 
-// The directory whose capability files are upgraded; empty when there is none.
+// The directory whose capability files are upgraded; empty if there is none.
 static std::string gstrRemoteCapDir;
 
 static int KiAtoi(const char* szText) { return szText == nullptr ? 0 : StrToInt32(szText); }
 
-// --- What the actions share ---
+// --- Helpers of the actions ---
 
-// Runs strSqlCmd as one transaction on the system database. A failure is logged under the calling
-// action's own line and name, which the defaults take from the call. Returns 0 or -1.
+// Runs strSqlCmd as one transaction on the system database. Logs a failure with the line and the
+// name of the calling action, which the default arguments supply. Returns 0 or -1.
 static int RunSql(const std::string& strSqlCmd, DBResult_tag** ppResult = nullptr,
                   int LineNo = __builtin_LINE(), const char* szFunc = __builtin_FUNCTION()) {
   if (KiDB::Execute(KiDB::DBI_SYSTEM, strSqlCmd, ppResult, false) != 0) {
@@ -52,8 +52,8 @@ static int RunSql(const std::string& strSqlCmd, DBResult_tag** ppResult = nullpt
   return 0;
 }
 
-// Runs each statement as a transaction of its own and stops at the first that fails: the ones
-// before it stay done.
+// Runs each statement in its own transaction and stops at the first failure. The statements before
+// it stay committed.
 static int RunSteps(std::initializer_list<const char*> Statements, int LineNo = __builtin_LINE(),
                     const char* szFunc = __builtin_FUNCTION()) {
   for (const char* szStatement : Statements) {
@@ -69,7 +69,7 @@ struct ProfileChange {
   const char* szCondition;  // " AND ...;", beginning with a blank
 };
 
-// Runs the changes, each narrowed by strConstraint, together as one transaction.
+// Runs all changes in one transaction. strConstraint limits each of them.
 static int RunProfile(const std::string& strConstraint,
                       std::initializer_list<ProfileChange> Changes, int LineNo = __builtin_LINE(),
                       const char* szFunc = __builtin_FUNCTION()) {
@@ -249,7 +249,7 @@ static int UpdatePanasonicSFN631L() {
       "WHERE vendor='Panasonic-iPro' AND model='WV-SFN631L' AND osd_position<>6");
 }
 
-// The bit rate of a stream stands before its resolution: the condition of both is the old
+// Sets the bit rate of a stream before its resolution, because both conditions test the old
 // resolution.
 static int UpdateDAHUASD4XC212S() {
   const std::string strConstraint =
@@ -258,7 +258,7 @@ static int UpdateDAHUASD4XC212S() {
   return RunProfile(
       strConstraint,
       {
-          // both blanks belong here
+          // both trailing blanks are intended
           {"UPDATE camera SET rec_cbr_bitrate=2048, fps_2=10  ",
            " AND (resolution='1280x960' OR resolution='640x480') AND rec_bitrate_ctrl=2;"},
           {"UPDATE camera SET resolution='1280x720' ",
@@ -346,7 +346,7 @@ static int UpdateTpLinkNC450() {
       "WHERE vendor='TP-LINK' AND model='NC450' AND firmware='';");
 }
 
-// connected_wire is a row of bytes with small values, not of digits.
+// connected_wire is a string of bytes with small values, not of digits.
 static std::string AddSecondOutput(std::string strConnectedWire) {
   const size_t Len = strConnectedWire.size();
   if (Len < 2) {
@@ -359,7 +359,7 @@ static std::string AddSecondOutput(std::string strConnectedWire) {
   return strConnectedWire;
 }
 
-// Releases what it holds on every path, null too, as the database library allows.
+// Releases the result set on every path. KiDBFreeResult accepts null.
 struct ResultOwner {
   ResultOwner() = default;
   ~ResultOwner() { KiDB::KiDBFreeResult(pResult); }
@@ -368,8 +368,8 @@ struct ResultOwner {
   DBResult_tag* pResult = nullptr;
 };
 
-// Each statement is a transaction of its own. Every run adds one more "DO 2" row to each camera:
-// the version threshold is what keeps the action from running again.
+// Runs each statement in its own transaction. Every run adds another "DO 2" row to each camera:
+// only the version threshold prevents a second run.
 static int UpdateAxisA8105E() {
   ResultOwner Result;
   if (RunSql("SELECT id,id_on_rec_server,owner_ds_id,connected_wire from camera "
@@ -434,7 +434,7 @@ static int UpdateReolinkRLC411And423Series() {
 
 // --- Capability files ---
 
-// The value of strKey; nothing when the key or the file is missing, or the file cannot be read.
+// The value of strKey; empty if the key or the file is missing or the file cannot be read.
 static std::string GetConfKeyValue(const std::string& strFilePath, const std::string& strKey) {
   char szValue[512] = "";
   const int Len =
@@ -449,14 +449,14 @@ struct DirCloser {
   }
 };
 
-// Calls pUpgradeFile for every entry of the capability directory, whatever its type or name, until
-// one fails. Returns -1 when one did or when there is no capability directory. One that cannot be
-// opened or read holds nothing to do.
+// Calls pUpgradeFile for every entry of the capability directory, of any type and name, until a
+// call fails. Returns -1 if a call failed or if there is no capability directory. A directory that
+// cannot be opened counts as empty; a read error counts as its end.
 static int ForEachCapFile(int (*pUpgradeFile)(const std::string& strFilePath)) {
   if (gstrRemoteCapDir.empty()) {
     return -1;
   }
-  char szCapPath[512];  // deliberately cuts longer names
+  char szCapPath[512];  // deliberately truncates longer names
   snprintf(szCapPath, sizeof(szCapPath), "%s", gstrRemoteCapDir.c_str());
   const std::unique_ptr<DIR, DirCloser> pDir(opendir(szCapPath));
   if (pDir == nullptr) {
@@ -474,8 +474,8 @@ static int ForEachCapFile(int (*pUpgradeFile)(const std::string& strFilePath)) {
   return 0;
 }
 
-// A file's changes are made in one replacement: a file that is left between the marker and the axes
-// would let the next run take a continuous axis for a stepping one.
+// Makes all changes of a file in one replacement. If only the removal of the marker were done, the
+// next run would turn a continuous axis into a stepping one.
 static int UpgradeOnvifConfForPtzContinuousMove() {
   return ForEachCapFile([](const std::string& strFilePath) {
     const ZAMOCReading Reading(strFilePath);
@@ -493,7 +493,7 @@ static int UpgradeOnvifConfForPtzContinuousMove() {
       return 0;
     }
     const int Err = ZAMOCFileChangeKeys(strFilePath.c_str(), Changes.data(), Changes.size());
-    return blPtzContinuousMove ? Err : 0;  // only the marker's removal has to succeed
+    return blPtzContinuousMove ? Err : 0;  // only the removal of the marker must succeed
   });
 }
 
@@ -514,7 +514,7 @@ static int UpgradeOnvifConfForContinuousPtzSpeed() {
 
 // --- The action tables ---
 
-// A row that always runs may have any place; the others ascend past it.
+// True if the thresholds ascend. Rows that always run (threshold 0) may be anywhere.
 template <size_t Rows>
 static constexpr bool ThresholdsAscend(const UPD_LIST (&rgTable)[Rows]) {
   uint32_t Highest = 0;
@@ -532,8 +532,8 @@ static constexpr bool EndsWithNull(const UPD_LIST (&rgTable)[Rows]) {
   return rgTable[Rows - 1].orgVersion == 0 && rgTable[Rows - 1].pFuncUpdate == nullptr;
 }
 
-// GCC folds no comparison of a function with null under UndefinedBehaviorSanitizer, one of null it
-// does.
+// Under UndefinedBehaviorSanitizer, GCC does not fold the comparison of a function with null into a
+// constant, but it does fold the comparison of null with null.
 template <size_t Rows>
 static constexpr bool AllHaveActions(const UPD_LIST (&rgTable)[Rows]) {
   for (size_t Idx = 0; Idx + 1 < Rows; ++Idx) {
@@ -607,8 +607,8 @@ static int DoAction(const UPD_LIST* pAction, uint32_t orgVer, int Idx) {
   return Err;
 }
 
-// Runs the selected rows in order. A failing action does not stop the ones after it. Returns -1
-// when any failed, else 0.
+// Runs the selected actions in order. A failed action does not stop the later ones. Returns -1 if
+// any action failed, else 0.
 static int DoActions(const UPD_LIST* pAction, uint32_t orgVer) {
   int Err = 0;
   for (int Idx = 0; pAction[Idx].pFuncUpdate != nullptr; ++Idx) {
@@ -633,7 +633,7 @@ static void Usage() {
 }
 
 int main(int argc, char* argv[]) {
-  // What a transaction took for the pages that it changed, up to 2 MB, stays for the next one.
+  // Keep freed heap, up to 2 MB a transaction, so that the next need not ask the kernel again.
   mallopt(M_TRIM_THRESHOLD, 4 * 1024 * 1024);
   int Err = 0;
   if (argc == 2) {
