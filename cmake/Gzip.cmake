@@ -1,6 +1,7 @@
 find_program(GZIP_EXECUTABLE gzip REQUIRED)
 
-# Builds NAME.gz of File in the current binary directory: the same bytes of the same content.
+# Compresses File to NAME.gz in the current binary directory. The same content always gives the same
+# bytes.
 function(gzip File)
   cmake_path(GET File FILENAME Name)
   add_custom_command(OUTPUT ${Name}.gz COMMAND ${GZIP_EXECUTABLE} -9nc ${File} > ${Name}.gz

@@ -1,5 +1,5 @@
-# The appliance: ARMv7-A with hardware floating point. The cross compiler is Debian's; what else is
-# needed for this processor, scripts/bootstrap armhf unpacks into the sysroot.
+# Toolchain for the appliance: ARMv7-A with hardware floating point. The cross compiler is Debian's.
+# scripts/bootstrap armhf unpacks the other packages for this processor into the sysroot.
 set(CMAKE_SYSTEM_NAME Linux)
 set(CMAKE_SYSTEM_PROCESSOR armv7l)
 set(CMAKE_LIBRARY_ARCHITECTURE arm-linux-gnueabihf)
@@ -10,7 +10,7 @@ set(CMAKE_FIND_ROOT_PATH ${TESSEL_ROOT}/build/armhf-sysroot)
 set(CMAKE_FIND_ROOT_PATH_MODE_PROGRAM NEVER)
 set(CMAKE_FIND_ROOT_PATH_MODE_LIBRARY ONLY)
 set(CMAKE_FIND_ROOT_PATH_MODE_INCLUDE ONLY)
-# CMake packages may also lie where a build of this project was installed.
+# Search the host too: an installed build of this project may be outside the sysroot.
 set(CMAKE_FIND_ROOT_PATH_MODE_PACKAGE BOTH)
 
 # In the cache, where the tests of programs find it.
