@@ -47,9 +47,9 @@ int main(int /*argc*/, char** argv) {
     return 0;
   }
   if (strCommand == "write") {
-    static KiDbgLogCfg gCfg = {};
-    gCfg.SetLogInMs(true);
-    g_pDbgLogCfg = &gCfg;
+    static KiDbgLogCfg Cfg = {};
+    Cfg.SetLogInMs(true);
+    g_pDbgLogCfg = &Cfg;
     const std::thread Other(WriteLines);
     WriteLines();
   }

@@ -104,9 +104,9 @@ TEST_F(KeyVal, NoUpdateIsLostAndNoReaderSeesHalfAFile) {
   setrlimit(RLIMIT_NOFILE, &Descriptors);
   KiFileSetVal(NAME, "z", "end", false);
   std::atomic<int> Running = 8;
-  std::vector<std::thread> Writers;
+  std::thread rgWriter[8];
   for (int Writer = 0; Writer < 8; ++Writer) {
-    Writers.emplace_back([Writer, &Running] {
+    rgWriter[Writer] = std::thread([Writer, &Running] {
       for (int Key = 0; Key < 50; ++Key) {
         KiFileSetVal(NAME, std::to_string(50 * Writer + Key).c_str(), "x", false);
       }
@@ -118,7 +118,7 @@ TEST_F(KeyVal, NoUpdateIsLostAndNoReaderSeesHalfAFile) {
     const std::string strText = "\n" + ReadFile(NAME);
     Cut += strText.size() < 7 || strText.substr(strText.size() - 7) != "\nz=end\n" ? 1 : 0;
   }
-  for (std::thread& Writer : Writers) {
+  for (std::thread& Writer : rgWriter) {
     Writer.join();
   }
   KeyValMap KeyVals;

@@ -95,12 +95,12 @@ TEST_F(Utils, TimerCountsFromThePlannedTickUnlessItIsPast) {
 }
 
 TEST_F(Utils, TimerDoesNotWaitForAClockThatWasSetBack) {
-  static DelayTimer gTimer(400000);
-  static int64_t gWithin = -1;
-  signal(SIGALRM, [](int) { gWithin = Tick(&gTimer); });  // its last tick is yet to come
+  static DelayTimer Timer(400000);
+  static int64_t Within = -1;
+  signal(SIGALRM, [](int) { Within = Tick(&Timer); });  // its last tick is yet to come
   ualarm(10000, 0);
-  EXPECT_GE(Tick(&gTimer), 390);
-  EXPECT_LT(gWithin, 200);
+  EXPECT_GE(Tick(&Timer), 390);
+  EXPECT_LT(Within, 200);
 }
 
 TEST_F(Utils, WriteFdGoesOnAfterSignalsAndFullPipes) {
@@ -132,11 +132,11 @@ TEST_F(Utils, WriteFdGoesOnAfterSignalsAndFullPipes) {
 }
 
 TEST_F(Utils, ThreadHasTheStackAndStateAskedFor) {
-  static int gHold[2];  // a pipe: the threads wait until it is closed
-  ASSERT_EQ(pipe(gHold), 0);
+  static int rgHold[2];  // a pipe: the threads wait until it is closed
+  ASSERT_EQ(pipe(rgHold), 0);
   const ThreadFunc pWait = [](void* pParam) -> void* {
     char Byte;
-    return read(gHold[0], &Byte, 1) == 0 ? pParam : nullptr;
+    return read(rgHold[0], &Byte, 1) == 0 ? pParam : nullptr;
   };
   pthread_t Detached;
   pthread_t Joinable;
@@ -152,7 +152,7 @@ TEST_F(Utils, ThreadHasTheStackAndStateAskedFor) {
   pthread_attr_destroy(&Attr);
   EXPECT_EQ(Size, 16U << 20);
   EXPECT_EQ(State, PTHREAD_CREATE_DETACHED);
-  close(gHold[1]);
+  close(rgHold[1]);
   EXPECT_EQ(pthread_join(Joinable, &pReturned), 0);
   EXPECT_EQ(pReturned, &Size);
 }
