@@ -113,8 +113,12 @@ class Model:
     def is_open(self, name):
         return self.live().get(name) in self.open.values()
 
+    def live_file(self, name):
+        number = self.live().get(name)
+        return None if number is None else changed(*self.nodes[number])
+
     def live_disk(self):
-        return {name: changed(*self.nodes[number]) for name, number in self.live().items()}
+        return {name: self.live_file(name) for name in self.live()}
 
     def replay(self, line):
         """Makes the change of a traced call. Returns whether it makes one."""
