@@ -24,7 +24,7 @@ class Tool {
   // program when it is empty, on the directory strTarget, which must exist.
   Tool(const std::string& strTool, const std::string& strOwnProgram, const std::string& strTarget);
 
-  // "tesselupgrader 1.0.0 (FILE)".
+  // "tesselupgrader VERSION (FILE)".
   std::string Describe() const;
   UpgradeRun Upgrade(const std::string& strVersion) const;
   std::string CapDir() const { return m_strTarget + "/@camveld/@KICapInfo"; }

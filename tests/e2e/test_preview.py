@@ -71,8 +71,9 @@ def preview(example, tmp_path_factory):
 
 def test_shows_what_the_upgrade_then_changes(preview):
     output = preview(preview.appliance.database, 0)
+    version = preview.appliance.run().output.splitlines()[0]
     upgrade = preview.appliance.upgrade(0)
-    assert output.startswith(f"tesselupgrader 1.0.0 ({preview.tool})\n")
+    assert output.startswith(f"{version} ({preview.tool})\n")
     changes = re.findall("^.*: .* -> .*$|^.* added: .*$", output, re.MULTILINE)
     assert sorted(changes) == sorted(upgrade.changes)
     assert output.endswith(
