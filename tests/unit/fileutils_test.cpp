@@ -55,18 +55,6 @@ TEST_F(KeyVal, LinesCarryPairs) {
   }
 }
 
-TEST_F(KeyVal, OnlyTheKeysAskedForAreRead) {
-  KeyValMap KeyVals = {{"old", "old"}};
-  std::string strVal = "old";
-  WriteFile(NAME, "a=1\nb=2\na=3\nc=4\n");
-  EXPECT_EQ(KiFileGetKeyVals(NAME, {"a", "c", "x"}, KeyVals), 3);
-  EXPECT_EQ(KeyVals, (KeyValMap{{"a", "1"}, {"c", "4"}}));
-  EXPECT_EQ(KiFileGetVal(NAME, "a", strVal), 2);
-  EXPECT_EQ(strVal, "1");
-  EXPECT_EQ(KiFileGetVal(NAME, "x", strVal), 0);
-  EXPECT_EQ(strVal, "");
-}
-
 TEST_F(KeyVal, ChangesLeaveSortedPairs) {
   const char* const szText = "#c\nb=\"2\"\n\na=1\nb=3\n";
   EXPECT_EQ(KiFileSetVal(NAME, "n", "new", true), 0);
