@@ -12,6 +12,8 @@ ROW = re.compile(r"^\| (\d+) \| `(\w+)` \|", re.M)
 
 @pytest.mark.parametrize("below", [1, 0])
 def test_the_page_lists_what_the_tool_runs(appliance, below):
+    if appliance.sanitizers or appliance.emulator:
+        pytest.skip("the page is compared with the release build, which is fast")
     page = (SOURCE / "docs/migrations.md").read_text()
     cameras, files = (ROW.findall(part) for part in page.split("## Capability files"))
     tool = appliance.directory / "tool"
