@@ -35,9 +35,11 @@ int KiFileGetVal(const char* szFile, const char* szKey, std::string& strVal);
 //
 // The new content is written to "szFile.tmp.XXXXXX" in the same directory. That file gets the
 // owner, group and mode of szFile and then replaces it. A reader sees all of a change or nothing,
-// and no change of another caller is lost. A symbolic link is itself replaced. The new content is
-// not synced to stable storage. Thread cancellation is disabled meanwhile and always enabled on
-// return.
+// and no change of another caller is lost. A symbolic link is itself replaced.
+//
+// The change is not synced to stable storage. After a power cut, the file may be the old one or the
+// new one, empty, a part of the new one, or the new one with the mode and owner of the temporary
+// file. Thread cancellation is disabled meanwhile and always enabled on return.
 //
 // Return 0, or -1 with the file unchanged if it cannot be read, or if it cannot be replaced by a
 // file of the same owner (a process without privileges cannot give files to others). Return 0 at
