@@ -3,11 +3,12 @@
 import re
 import shutil
 import sqlite3
+import subprocess
 import threading
 from contextlib import closing
 
 import pytest
-from conftest import TEMPORARY_FILE, Appliance
+from conftest import SOURCE, TEMPORARY_FILE, Appliance
 
 WRITES = re.compile(
     r"\bopen\w*\(.*O_(WRONLY|RDWR|CREAT)"
@@ -80,3 +81,48 @@ def test_two_runs_beside_the_recorder_do_what_one_after_the_other_does(example, 
         assert (reader.execute(names).fetchone() == before) == (mode == "wal")
     assert example.sql("SELECT DISTINCT update_time FROM camera") == [(counts[-1],)]
     assert left_behind(example) == left_behind(twin)
+
+
+def test_the_tool_runs_in_a_bare_root_with_little_memory(example):
+    """The root holds the tool, libc and the loader: no locale, /usr, /tmp or /proc."""
+    if not example.emulator:
+        pytest.skip("only a build for the appliance has its libraries")
+    root = example.directory / "root"
+    target = root / "var/packages/Camveld/target"
+    shutil.copytree(example.directory / "@camveld", target / "@camveld")
+    shutil.copy(example.database, target)
+    libraries = [f"arm-linux-gnueabihf/lib{name}.so.6" for name in "cm"]
+    for name in (f"lib/{library}" for library in ["ld-linux-armhf.so.3", *libraries]):
+        (root / name).parent.mkdir(parents=True, exist_ok=True)
+        shutil.copy(SOURCE / "build/armhf-sysroot" / name, root / name)
+    shutil.copy(shutil.which("qemu-arm-static"), root / "emulator")
+    shutil.copy(example.build / "main/tesselupgrader", root)
+    (root / "var/log/camveld").mkdir(parents=True)
+    # Of 256 MB of data the emulator takes more than 128 for itself.
+    for megabytes, works in [(128, False), (256, True)]:
+        limit = ["prlimit", f"--data={megabytes << 20}", "env", "-i", shutil.which("chroot"), root]
+        ended = subprocess.run([*limit, "/emulator", "/tesselupgrader", "0"], capture_output=True)
+        assert (ended.returncode == 0) == works, ended.stderr
+    assert example.upgrade(0).status == 0
+    assert (target / "system.db").read_bytes() == example.database.read_bytes()
+    files = target / "@camveld/@KICapInfo"
+    assert {path.name: path.read_text() for path in files.iterdir()} == example.capability_texts()
+
+
+def test_both_processors_share_one_configuration(example):
+    if not example.emulator:
+        pytest.skip("only a build for the appliance has a second processor")
+    here, library = example.directory / "client", SOURCE / "libkimodule/lib"
+    sources = [SOURCE / "tests/unit/client.cpp", *library.glob("*.cpp")]
+    subprocess.run(["c++", "-std=c++17", f"-I{library}", *sources, "-o", here], check=True)
+    contents, shown = [], []
+    for writer, reader in [
+        ([here], example.command("client")),
+        (example.command("client"), [here]),
+    ]:
+        file = example.directory / f"written-by-{len(shown)}"
+        subprocess.run([*writer, "fill", file], check=True)
+        contents.append(file.read_bytes())
+        shown.append(subprocess.check_output([*reader, "show", file]))
+    assert contents[0] == contents[1] and len(contents[0]) == 2568
+    assert shown[0] == shown[1]
