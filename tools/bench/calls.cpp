@@ -26,7 +26,7 @@
 namespace {
 
 using std::string;
-using KEY_VAL_MAP = std::map<string, string>;
+using KeyValMap = std::map<string, string>;
 
 constexpr const char* LOG_FILE = "/var/log/camveld/camveld.log";
 constexpr const char* SETTINGS = "/var/settings";
@@ -60,21 +60,21 @@ int TakeLast(void* pVal, const char* /*szSection*/, const char* szKey, const cha
 }
 
 int TakeAll(void* pKeyVals, const char* /*szSection*/, const char* szKey, const char* szVal) {
-  (*static_cast<KEY_VAL_MAP*>(pKeyVals))[szKey] = szVal;
+  (*static_cast<KeyValMap*>(pKeyVals))[szKey] = szVal;
   return 1;
 }
 
-string LastAndCount(const KEY_VAL_MAP& KeyVals) {
+string LastAndCount(const KeyValMap& KeyVals) {
   return KeyVals.at(LAST_KEY) + itos(static_cast<int>(KeyVals.size()));
 }
 
-using CALL = std::function<string()>;
+using CallFunc = std::function<string()>;
 
 const struct {
   string strCall;
-  CALL Ours;
+  CallFunc Ours;
   string strPeer;
-  CALL Theirs;
+  CallFunc Theirs;
 } rgCall[] = {
     {"KiPrintf",
      [] {
@@ -113,13 +113,13 @@ const struct {
      }},
     {"KiFileGetAllKeyVals",
      [] {
-       KEY_VAL_MAP KeyVals;
+       KeyValMap KeyVals;
        KiFileGetAllKeyVals(SETTINGS, KeyVals);
        return LastAndCount(KeyVals);
      },
      "libinih",
      [] {
-       KEY_VAL_MAP KeyVals;
+       KeyValMap KeyVals;
        ini_parse(SETTINGS, TakeAll, &KeyVals);
        return LastAndCount(KeyVals);
      }},
@@ -138,7 +138,7 @@ const struct {
      }},
 };
 
-void Register(string strName, const string& strWay, const CALL& Call, const CALL& Other) {
+void Register(string strName, const string& strWay, const CallFunc& Call, const CallFunc& Other) {
   strName.append("/").append(strWay);
   benchmark::RegisterBenchmark(strName.c_str(), [=](benchmark::State& State) {
     if (Call() != Other()) {
