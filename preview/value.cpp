@@ -37,12 +37,12 @@ std::string SqlReal(double Real) {
   if (strReal.size() <= 16 && (Magnitude == 0 || (Magnitude > 1e-5 && Magnitude < 1e15))) {
     return strReal;
   }
-  constexpr int MAX_SHIFT = 62;
+  constexpr int MaxShift = 62;
   int Exponent = 0;
   const auto Mantissa = static_cast<int64_t>(std::ldexp(std::frexp(Real, &Exponent), 53));
   strReal = "(" + std::to_string(Mantissa) + ".0";
   for (int Left = Exponent - 53; Left != 0;) {
-    const int Shift = std::min(std::abs(Left), MAX_SHIFT);
+    const int Shift = std::min(std::abs(Left), MaxShift);
     strReal += (Left < 0 ? " / " : " * ") + std::to_string(int64_t{1} << Shift) + ".0";
     Left += Left < 0 ? Shift : -Shift;
   }

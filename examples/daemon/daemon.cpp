@@ -16,13 +16,13 @@ static void OnTerm(int /*Signal*/) { g_blEnd = 1; }
 int main() {
   std::string strInterval;
   KiFileGetVal("/var/packages/Camveld/etc/settings.conf", "exampled_interval", strInterval);
-  const int msInterval = atoi(strInterval.c_str());
-  if (msInterval < 1 || msInterval > 60000) {
+  const auto Interval = static_cast<int>(strtol(strInterval.c_str(), nullptr, 10));
+  if (Interval < 1 || Interval > 60000) {
     KIDBGLOG(LOG_CATEG_EVENT, LOG_LEVEL_ERROR, "Bad interval [%s]\n", strInterval.c_str());
     return EXIT_FAILURE;
   }
   signal(SIGTERM, OnTerm);
-  DelayTimer Timer(msInterval * 1000);
+  DelayTimer Timer(Interval * 1000);
   while (!g_blEnd) {
     KIDBGLOG(LOG_CATEG_EVENT, LOG_LEVEL_NOTICE, "Tick\n");
     Timer.Delay();
