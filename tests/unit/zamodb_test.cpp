@@ -29,6 +29,16 @@ std::string TakeRows(DBResult* pResult) {
   return strRows;
 }
 
+TEST_F(Database, OnlyWritableDatabasesAreOpened) {
+  const char* const szDir = "/var/packages/Camveld/target";
+  mount(szDir, szDir, nullptr, MS_BIND, nullptr);
+  mount(nullptr, szDir, nullptr, MS_REMOUNT | MS_BIND | MS_RDONLY, nullptr);
+  EXPECT_EQ(ZAMODBConnect(nullptr, nullptr, nullptr, SYSTEM_DB), nullptr);
+  umount2(szDir, MNT_DETACH);
+  EXPECT_EQ(ZAMODBConnect(nullptr, nullptr, nullptr, szDir), nullptr);
+  EXPECT_EQ(ZAMODBConnect(nullptr, nullptr, nullptr, ":memory:"), nullptr);
+}
+
 TEST_F(Database, TextsRunToTheirFirstFailure) {
   const struct {
     const char* szText;
