@@ -50,7 +50,7 @@ def test_failing_step_is_logged_and_leaves_the_file(appliance, action, failure, 
     file = appliance.directory / "files/f"
     file.parent.mkdir()
     file.write_text("a=1\n" + "x" * 8000)
-    strace = ["strace", "-f", "-o", "/dev/null", "-e", f"inject={failure}"]
+    strace = ["strace", "-o", "/dev/null", "-e", f"inject={failure}"]
     if "when" in failure and "write" not in failure:
         strace += ["-P", file]
     ended = appliance.inside(*strace, *appliance.command("client", action, file, "b", "2"))
