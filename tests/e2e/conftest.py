@@ -14,10 +14,11 @@ import socket
 import sqlite3
 import subprocess
 import tempfile
-import threading
 from contextlib import closing, contextmanager
 from dataclasses import dataclass
 from pathlib import Path
+from subprocess import PIPE, STDOUT
+from threading import Thread
 
 import pytest
 
@@ -28,16 +29,14 @@ PROGRAMS = {
     "kidbglog": "tools/kidbglog",
     "client": "tests/unit/client",
 }
-# Where a capability file is written anew before it gets its name.
-TEMPORARY_FILE = re.search(r"\.\w+\.tmp", (SOURCE / "platform/zamoc.h").read_text())[0]
-# Nov 24 10:00:00 [4711] tesselupgrader.cpp:123:
-LOG_PREFIX = re.compile(r"^\w{3} [ \d]\d [\d:.]+ \[\d+\](?:\[\d+\])? ?((?:\[.*?\] )?[^:]*:)\d+:")
-# <11>Nov 24 10:00:00 tesselupgrader:
+# Time, process and line number of a log line.
+LOG_PREFIX = re.compile(r"^.{15}[.\d]* \[\d+\] ?|(?<=\.cpp):\d+")
+# Priority, time and program of a message to syslog.
 SYSLOG_PREFIX = re.compile(r"^<\d+>.{15} [^:]*: ?")
 
 
 def pytest_addoption(parser):
-    parser.addoption("--build", default="build/dev", help="the build tree of the tested programs")
+    parser.addoption("--build", default="build/dev", help="the build tree of the programs")
     parser.addoption("--accept", action="store_true", help="write tests/expected/ anew")
 
 
@@ -49,90 +48,12 @@ class Result:
     output: str
     log: list
     syslog: list
-    before: dict
-    after: dict
-    diffs: str
-
-    @property
-    def changes(self):
-        """A line for each changed cell and each added or removed row."""
-        lines = []
-        for key in sorted(self.before.keys() | self.after.keys(), key=row_order):
-            lines += row_changes(key, self.before.get(key), self.after.get(key))
-        return lines
-
-
-def show(value):
-    """Returns the value in printable ASCII, different from every other value."""
-    if value is None:
-        return "NULL"
-    if isinstance(value, bytes):
-        return f"x'{value.hex()}'"
-    if not isinstance(value, str):
-        return str(value)
-    return "'" + escape(value) + "'"
-
-
-def escape(text):
-    shown = ""
-    for byte in text.encode(errors="surrogateescape"):
-        if chr(byte) in "'\\":
-            shown += "\\"
-        shown += chr(byte) if 0x20 <= byte < 0x7F else f"\\x{byte:02x}"
-    return shown
-
-
-def row_order(key):
-    table, row = key
-    numbers = (int, float)
-    return table, [(0, v, "") if isinstance(v, numbers) else (1, 0, show(v)) for v in row]
-
-
-def row_changes(key, before, after):
-    table, row = key
-    name = f"{table} {', '.join(show(value) for value in row)}"
-    if before is None or after is None:
-        cells = [f"{column}={show(value)}" for column, value in (before or after).items()]
-        return [f"{name} {'removed' if after is None else 'added'}: {', '.join(cells)}"]
-    if table == "camera" and "vendor" in before and "model" in before:
-        name += " ({} {})".format(*(escape(str(before[column])) for column in ("vendor", "model")))
-    return [
-        f"{name} {column}: {show(value)} -> {show(after[column])}"
-        for column, value in before.items()
-        if (type(value), value) != (type(after[column]), after[column])
-    ]
-
-
-class Syslog:
-    """Receives what is sent to a socket while the block runs."""
-
-    def __init__(self, path):
-        self.messages = []
-        self._path = path
-        self._reader = threading.Thread(target=self._read)
-
-    def __enter__(self):
-        self._path.unlink(missing_ok=True)
-        self._socket = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
-        self._socket.bind(str(self._path))
-        self._reader.start()
-        return self
-
-    def __exit__(self, *_):
-        with socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM) as end:
-            end.sendto(b"", str(self._path))
-        self._reader.join()
-        self._socket.close()
-        self._path.unlink()
-
-    def _read(self):
-        while record := self._socket.recv(65536):
-            text = record.decode(errors="backslashreplace").rstrip("\0\n")
-            self.messages.append(SYSLOG_PREFIX.sub("", text))
+    changes: list  # a line for each changed cell, and each added or removed row
+    diffs: str  # of the capability files
 
 
 class Appliance:
-    """A recorder's directory, on which programs of a build tree run as root would run them."""
+    """A recorder's directory, on which programs run as root would run them."""
 
     def __init__(self, directory, build):
         self.directory = directory
@@ -140,50 +61,49 @@ class Appliance:
         self.database = directory / "system.db"
         self.caps = directory / "@camveld/@KICapInfo"
         self.log_file = directory / "log/camveld.log"
-        self.caps.mkdir(parents=True)
-        self.log_file.parent.mkdir()
+        self.enter = [SOURCE / "tools/private-appliance", directory]
         cache = (build / "CMakeCache.txt").read_text()
         self.emulator = re.findall(r"^CMAKE_CROSSCOMPILING_EMULATOR:\w+=(.+)$", cache, re.M)
         self.sanitizers = re.findall(r"^TESSEL_SANITIZE:\w+=(.+)$", cache, re.M)
 
-    def sql(self, text, *parameters):
-        """Runs one statement, and returns its rows, or a script of statements that end in ;."""
+    def load_example(self):
+        self.sql((SOURCE / "examples/appliance.sql").read_text())
+        shutil.copytree(SOURCE / "examples/KICapInfo", self.caps, dirs_exist_ok=True)
+
+    def sql(self, text, row_factory=None):
+        """Runs one statement and returns its rows, or several that each end in a semicolon."""
         database = sqlite3.connect(self.database, timeout=30, isolation_level=None)
+        database.row_factory = row_factory
         database.text_factory = lambda text: text.decode(errors="surrogateescape")
         with closing(database):
             database.execute("PRAGMA synchronous = off")
-            if ";" in text and not parameters:
+            if ";" in text:
                 database.executescript(text)
                 return []
-            return database.execute(text, parameters).fetchall()
+            return database.execute(text).fetchall()
 
     def capability_file(self, name, text):
         path = self.caps / name
-        path.write_bytes(text if isinstance(text, bytes) else text.encode())
+        path.write_text(text, newline="")
         return path
 
     def upgrade(self, version, under=()):
-        """Runs the tool as an installer that replaces a package of that version does."""
+        """Runs the tool as the installer does that replaces a package of this version."""
         return self.run(str(version), under=under)
 
     def run(self, *arguments, under=()):
         """Runs the tool, under a command such as strace if there is one."""
-        before, files = self.rows(), self.capability_texts()
-        logged = self.log_file.stat().st_size if self.log_file.exists() else 0
-        with Syslog(self.directory / "syslog") as syslog:
+        rows, texts = self.rows(), self.capability_texts()
+        self.log_file.unlink(missing_ok=True)
+        with syslog(self.directory / "syslog") as messages:
             ended = self.inside(*under, *self.command("tesselupgrader", *arguments))
-        log = b""
-        if self.log_file.exists():
-            log = self.log_file.read_bytes()[logged:]
-        lines = log.decode(errors="backslashreplace").split("\n")
         return Result(
             status=ended.returncode,
             output=ended.stdout,
-            log=[LOG_PREFIX.sub(r"\1", line) for line in lines[:-1]],
-            syslog=syslog.messages,
-            before=before,
-            after=self.rows(),
-            diffs=unified_diffs(files, self.capability_texts()),
+            log=self.log_lines(),
+            syslog=messages,
+            changes=changed_rows(rows, self.rows()),
+            diffs=unified_diffs(texts, self.capability_texts()),
         )
 
     def command(self, name, *arguments):
@@ -194,46 +114,89 @@ class Appliance:
         """Runs any command where this is the machine's appliance."""
         environment = dict(os.environ)
         if "strace" in command:
-            environment["ASAN_OPTIONS"] = "detect_leaks=0"  # it cannot look for them when traced
+            # The leak checker does not work in a traced program.
+            environment["ASAN_OPTIONS"] = "detect_leaks=0"
         return subprocess.run(
-            [SOURCE / "tools/private-appliance", self.directory, *command],
-            stdout=subprocess.PIPE,
-            stderr=subprocess.STDOUT,
+            [*self.enter, *command],
+            stdout=PIPE,
+            stderr=STDOUT,
             text=True,
             errors="backslashreplace",
             env=environment,
             timeout=300,
         )
 
+    def log_lines(self):
+        """Returns the lines of the log, without time, process and line number."""
+        if not self.log_file.exists():
+            return []
+        text = self.log_file.read_text(errors="backslashreplace")
+        return [LOG_PREFIX.sub("", line) for line in text.splitlines()]
+
     def rows(self):
-        """Returns the columns of every row, by its table and key; none if they cannot be read."""
-        rows = {}
+        """Returns all rows by table and first column; none if the database cannot be read."""
         if not self.database.exists():
-            return rows
+            return {}
+        tables = "SELECT name FROM sqlite_schema WHERE type = 'table' AND name NOT LIKE 'sqlite%'"
         try:
-            for _, table, kind, _, without_rowid, _ in self.sql("PRAGMA main.table_list"):
-                if kind == "table" and not table.startswith("sqlite_"):
-                    rows.update(self.table_rows(table, without_rowid))
+            return {
+                (table, row[0]): dict(row)
+                for (table,) in self.sql(tables)
+                for row in self.sql(f"SELECT * FROM {table}", sqlite3.Row)
+            }
         except sqlite3.DatabaseError:
             return {}
-        return rows
-
-    def table_rows(self, table, without_rowid):
-        columns = self.sql(f'PRAGMA table_info("{table}")')
-        names = [column[1] for column in columns]
-        key = [f'"{column[1]}"' for column in columns if column[5]] if without_rowid else ["rowid"]
-        for row in self.sql(f'SELECT {", ".join(key)}, * FROM "{table}"'):
-            yield (table, row[: len(key)]), dict(zip(names, row[len(key) :]))
 
     def capability_texts(self):
-        """Returns the text of every regular file of some size at most, by name."""
-        if not self.caps.is_dir():
-            return {}
+        """Returns the text of each regular file by its name."""
         return {
             path.name: path.read_text(errors="backslashreplace")
-            for path in self.caps.iterdir()
-            if path.is_file() and not path.is_symlink() and path.stat().st_size < 1000000
+            for path in self.caps.glob("*")
+            if path.is_file() and not path.is_symlink()
         }
+
+
+@contextmanager
+def syslog(path):
+    """Yields a list of what the socket receives until the block ends."""
+    messages = []
+
+    def receive():
+        while record := server.recv(65536):
+            text = record.decode(errors="backslashreplace").rstrip("\0\n")
+            messages.append(SYSLOG_PREFIX.sub("", text))
+
+    with socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM) as server:
+        server.bind(str(path))
+        receiver = Thread(target=receive)
+        receiver.start()
+        yield messages
+        with socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM) as last:
+            last.sendto(b"", str(path))
+        receiver.join()
+    path.unlink()
+
+
+def show(value):
+    return "NULL" if value is None else repr(value)
+
+
+def changed_rows(before, after):
+    lines = []
+    for key in sorted(before.keys() | after.keys()):
+        old, new = before.get(key), after.get(key)
+        name = f"{key[0]} {key[1]}"
+        if old is None or new is None:
+            cells = [f"{column}={show(value)}" for column, value in (old or new).items()]
+            lines.append(f"{name} {'removed' if old else 'added'}: {', '.join(cells)}")
+            continue
+        if key[0] == "camera":
+            name += f" ({old['vendor']} {old['model']})"
+        for column in old:
+            cells = show(old[column]), show(new[column])
+            if cells[0] != cells[1]:
+                lines.append(f"{name} {column}: {cells[0]} -> {cells[1]}")
+    return lines
 
 
 def unified_diffs(before, after):
@@ -247,14 +210,21 @@ def unified_diffs(before, after):
 
 @contextmanager
 def new_appliance(config):
+    """Makes an appliance, and keeps its namespaces until the block ends."""
     build = (SOURCE / config.getoption("build")).resolve()
-    with tempfile.TemporaryDirectory(prefix="tessel-", dir="/tmp") as directory:
-        yield Appliance(Path(directory), build)
-
-
-def load_example(appliance):
-    appliance.sql((SOURCE / "examples/appliance.sql").read_text())
-    shutil.copytree(SOURCE / "examples/KICapInfo", appliance.caps, dirs_exist_ok=True)
+    # In memory, where syncing costs nothing.
+    with tempfile.TemporaryDirectory(prefix="tessel-", dir="/dev/shm") as directory:
+        appliance = Appliance(Path(directory), build)
+        keeper = subprocess.Popen(
+            [*appliance.enter, "sh", "-c", "echo; cat"], stdin=PIPE, stdout=PIPE
+        )
+        keeper.stdout.readline()
+        namespaces = ["--mount", "--ipc"]
+        if os.getuid() != 0:
+            namespaces += ["--user", "--preserve-credentials"]
+        appliance.enter = ["nsenter", f"--target={keeper.pid}", *namespaces]
+        yield appliance
+        keeper.communicate()
 
 
 @pytest.fixture
@@ -267,5 +237,5 @@ def appliance(request):
 @pytest.fixture
 def example(appliance):
     """The appliance of examples/: many old cameras and some capability files."""
-    load_example(appliance)
+    appliance.load_example()
     return appliance

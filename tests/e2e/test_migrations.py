@@ -3,58 +3,83 @@
 Where a change is intended, scripts/test --accept writes the expected files anew.
 """
 
-import json
 import re
 import sqlite3
-import sys
-from concurrent.futures import ThreadPoolExecutor
 from dataclasses import dataclass
-from pathlib import Path
 
 import pytest
-from conftest import SOURCE, load_example, new_appliance, row_changes
+from conftest import SOURCE, new_appliance
 
 EXPECTED = SOURCE / "tests/expected"
-# Tests that need the list of actions share a process, since it takes seconds to make.
-with_actions = pytest.mark.xdist_group("actions")
+TABLE_ROW = re.compile(r"^ *\{(\d+), (?!nullptr)(\w+)\},$", re.M)
+FAILURE = re.compile(r"cpp:(\w+)\(\): KiDBExecute command \((.*?)\) error\.$", re.S | re.M)
+# These tests share a process, since finding all transactions takes seconds.
+with_transactions = pytest.mark.xdist_group("transactions")
 
 
 @dataclass
-class Action:
-    threshold: int
-    name: str
-    texts: list  # one a transaction
+class Transaction:
+    """An SQL text that the tool runs, and the changes that are missing without it."""
 
-    def statements(self):
-        return [statement for text in self.texts for statement in split(text)]
-
-
-def split(text):
-    """Splits a text behind each ; that ends a statement."""
-    statements = [""]
-    for part in re.split(r"(?<=;)", text):
-        if sqlite3.complete_statement(statements[-1]):
-            statements.append("")
-        statements[-1] += part
-    return [statement for statement in statements if statement.strip()]
-
-
-def printable(text):
-    return re.sub("[^ -~]", lambda character: f"\\x{ord(character[0]):02x}", text)
-
-
-def table_rows():
-    """Threshold and name of every row of the action tables, as they are written."""
-    source = (SOURCE / "main/tesselupgrader.cpp").read_text()
-    rows = re.findall(r"^ *\{(\d+), (\w+)\},$", source, re.M)
-    return [(int(threshold), name) for threshold, name in rows if name != "nullptr"]
+    action: str
+    text: str
+    missing: list
 
 
 def complain(title, lines):
-    """Fails with a title and few enough lines for a screen with several failures."""
+    """Fails with a title, and with few enough lines for a screen."""
     if len(lines) > 8:
         lines = [*lines[:7], f"and {len(lines) - 7} lines more"]
     pytest.fail("\n".join([title, *(line[:200] for line in lines)]), pytrace=False)
+
+
+def upgraded(example):
+    result = example.upgrade(0)
+    if result.status != 0:
+        failed = [line for line in result.log if "error" in line]
+        complain("the upgrade of the example fails", failed + result.syslog)
+    return result
+
+
+def failures(result):
+    """Returns action and text of each transaction that a run could not do."""
+    return FAILURE.findall("\n".join(result.log))
+
+
+def upgrade_without(example, number):
+    """Upgrades while the database cannot be opened the N-th time, or never when N is 0."""
+    inject = f"inject=openat:error=EIO:when={number}"
+    options = ["-f", "--seccomp-bpf", "-o", "/dev/null", "-e", "trace=openat", "-e", inject]
+    return example.upgrade(0, under=["strace", *options, "-P", example.database])
+
+
+@pytest.fixture(scope="module")
+def transactions(request):
+    """All transactions of an upgrade from version 0, in order."""
+    found = []
+    with new_appliance(request.config) as example:
+        example.load_example()
+        start = example.database.read_bytes()
+        changes = upgraded(example).changes
+        # The tool logs a text that it cannot run, and goes on with the next action.
+        for number in range(1, 1000):
+            example.database.write_bytes(start)
+            result = upgrade_without(example, number)
+            failed = failures(result)
+            if not failed:
+                break
+            assert (result.status, len(failed)) == (255, 1), failed
+            missing = [line for line in changes if line not in result.changes]
+            found.append(Transaction(*failed[0], missing))
+    return found
+
+
+def tables():
+    """Threshold and name of each row: of the database actions, and of the others."""
+    source = (SOURCE / "main/tesselupgrader.cpp").read_text()
+    parts = source.split("grgCamveldRemoteCapUpgradeAction[]")[:2]
+    rows = [TABLE_ROW.findall(part) for part in parts]
+    return [[(int(threshold), name) for threshold, name in part] for part in rows]
 
 
 @pytest.fixture
@@ -76,84 +101,55 @@ def accepts(request):
     return compare
 
 
-def list_actions(config, thresholds):
-    program = Path(__file__).with_name("transactions.py")
-    text = ",".join(map(str, thresholds))
-    with new_appliance(config) as appliance:
-        load_example(appliance)
-        command = appliance.command("tesselupgrader")
-        ended = appliance.inside(sys.executable, program, text, *command)
-    assert ended.returncode == 0, ended.stdout
-    return json.loads(ended.stdout.splitlines()[-1])
-
-
-@pytest.fixture(scope="module")
-def listed(request):
-    """Which database actions run for which version, and all transactions of each."""
-    thresholds = sorted({threshold for threshold, _ in table_rows() if threshold > 0})
-    halves = [thresholds[0::2], thresholds[1::2]]
-    with ThreadPoolExecutor() as pool:
-        first, second = pool.map(lambda half: list_actions(request.config, half), halves)
-    return {
-        "selected": {**first["selected"], **second["selected"]},
-        "transactions": first["transactions"] + second["transactions"],
-    }
-
-
-@pytest.fixture
-def selected(listed):
-    """The names of the database actions that run, by version."""
-    return {int(version): names for version, names in listed["selected"].items()}
-
-
-@pytest.fixture
-def actions(listed, selected):
-    """The database actions, in the order in which they run."""
-    actions = []
-    for name in selected[0]:
-        texts = [text for action, text in listed["transactions"] if action == name]
-        above = [version + 1 for version, names in selected.items() if name in names]
-        threshold = 0 if name in selected[max(selected)] else max(above)
-        actions.append(Action(threshold, name, texts))
-    return actions
-
-
-@with_actions
-def test_every_action_has_its_threshold_and_texts(actions, selected, accepts):
+@with_transactions
+def test_the_actions_and_their_transactions(transactions, accepts):
+    thresholds = {name: threshold for threshold, name in tables()[0]}
     lines = ["# Threshold and name of each database action; * begins a transaction."]
-    for action in actions:
-        lines.append(f"{action.threshold or 'always'} {action.name}")
-        for text in action.texts:
-            first, *others = split(text)
-            lines += [f"* {printable(first)}", *(f"  {printable(other)}" for other in others)]
+    last = None
+    for transaction in transactions:
+        if transaction.action != last:
+            last = transaction.action
+            lines.append(f"{thresholds[last]} {last}")
+        first, *others = statements(transaction.text)
+        lines += [f"* {printable(first)}", *(f"  {printable(other)}" for other in others)]
     accepts("actions.txt", "the list of actions differs", lines)
-    for version, names in sorted(selected.items()):
-        above = [action.name for action in actions if not 0 < action.threshold <= version]
-        assert names == above, f"an upgrade from {version} selects other actions"
 
 
-@with_actions
-def test_every_statement_finds_a_camera_in_the_example(actions, example):
+def test_each_version_selects_the_actions_above_it(appliance):
+    rows, _ = tables()
+    for version in sorted({threshold - below for threshold, _ in rows for below in (1, 0)}):
+        # Each action fails, since there is no database.
+        selected = [name for name, _ in failures(appliance.upgrade(version))]
+        above = [name for threshold, name in rows if threshold > version]
+        if selected != above:
+            complain(f"an upgrade from {version} selects other actions", selected)
+
+
+def printable(text):
+    return re.sub("[^ -~]", lambda character: f"\\x{ord(character[0]):02x}", text)
+
+
+def statements(text):
+    """Splits a text behind each semicolon that ends a statement."""
+    found = [""]
+    for part in re.split("(?<=;)", text):
+        if sqlite3.complete_statement(found[-1]):
+            found.append("")
+        found[-1] += part
+    return [statement for statement in found if statement.strip()]
+
+
+@with_transactions
+def test_every_statement_finds_a_camera_in_the_example(transactions, example):
     idle = []
     with sqlite3.connect(example.database) as database:
-        for action in actions:
-            for statement in action.statements():
-                try:
-                    rows = database.execute(statement)
-                except sqlite3.Error as error:
-                    complain(f"{action.name}: {error}", [printable(statement)])
+        for transaction in transactions:
+            for statement in statements(transaction.text):
+                rows = database.execute(statement)
                 if not (rows.fetchone() if rows.description else rows.rowcount > 0):
-                    idle.append(f"{action.name} finds no camera in the example: {statement}")
+                    idle.append(f"{transaction.action} finds no camera in the example: {statement}")
     if idle:
         complain(idle[0], idle[1:])
-
-
-def upgraded(example):
-    result = example.upgrade(0)
-    if result.status != 0:
-        failed = [line for line in result.log if "error" in line]
-        complain("the upgrade of the example fails", failed + result.syslog)
-    return result
 
 
 def test_an_upgrade_changes_these_cells(example, accepts):
@@ -169,69 +165,41 @@ def test_a_second_upgrade_adds_outputs_and_changes_no_camera(example, accepts):
     accepts("second-upgrade.txt", "what a second upgrade changes differs", changes)
 
 
-def test_cameras_that_must_stay_never_change(example):
+def test_cameras_do_what_their_name_says(example):
+    cameras = example.sql("SELECT id, name, vendor, model FROM camera")
+    changes = upgraded(example).changes
     wrong = []
-    result = upgraded(example)
-    for key, before in result.before.items():
-        changes = row_changes(key, before, result.after.get(key))
-        if before.get("name") == "must stay" and changes:
-            wrong += changes
-        if before.get("name") == "changes" and not changes:
-            wrong.append(f"{key[0]} {key[1][0]} ({before['vendor']} {before['model']}) stays")
+    for id, name, vendor, model in cameras:
+        found = [line for line in changes if line.startswith(f"camera {id} ")]
+        if name == "must stay":
+            wrong += found
+        elif name == "changes" and not found:
+            wrong.append(f"camera {id} ({vendor} {model}) stays")
     if wrong:
         complain("cameras do not do what their name says", wrong)
 
 
-def last_changes(actions, example):
-    """The last cell of a camera that each action of several statements changes."""
-    cells = {}
-    before = example.rows()
-    for action in actions:
-        statements = action.statements()
-        for statement in statements:
-            example.sql(statement.rstrip("; "))
-            after = example.rows()
-            for (table, row), values in after.items():
-                for column, value in values.items():
-                    old = before.get((table, row), values)[column]
-                    if table == "camera" and old != value and len(statements) > 1:
-                        cells[action.name] = (row[0], column, value)
-            before = after
-    return cells
-
-
-@with_actions
-def test_a_failure_at_the_last_statement_leaves_this(actions, example, accepts):
-    start = example.database.read_bytes()
-    expected = upgraded(example).changes
-    example.database.write_bytes(start)
-    cells = last_changes(actions, example)
-    example.database.write_bytes(start)
-    for name, (row, column, value) in cells.items():
-        ((quoted,),) = example.sql("SELECT quote(?)", value)
-        example.sql(
-            f'CREATE TRIGGER "{name}" BEFORE UPDATE OF {column} ON camera WHEN new.id = {row} '
-            f"AND new.{column} IS {quoted} BEGIN SELECT RAISE(ABORT, 'refused'); END;"
-        )
-    result = example.upgrade(0)
-    assert result.status == 255
-    lines = [f"{name} fails" for name in cells if f":{name}(): " in "".join(result.log)]
-    lines += [f"not done: {line}" for line in expected if line not in result.changes]
+@with_transactions
+def test_an_action_that_fails_in_the_middle_leaves_this(transactions, accepts):
+    lines = ["# What is not done if the second transaction of an action fails."]
+    for number, transaction in enumerate(transactions):
+        actions = [transaction.action for transaction in transactions[: number + 1]]
+        if actions.count(transaction.action) == 2:
+            lines += [f"{transaction.action}:", *transaction.missing]
     accepts("failures.txt", "what a failure in the middle leaves differs", lines)
 
 
-@with_actions
-def test_every_capability_action_changes_a_file(selected, example, accepts):
+def test_every_capability_action_changes_a_file(example, accepts):
     example.database.unlink()
     start = example.capability_texts()
-    lines, diffs = [], {}
-    capability_rows = [row for row in table_rows() if row[1] not in selected[0]]
-    for threshold, name in capability_rows:
+    lines = []
+    for threshold, name in tables()[1]:
+        diffs = []
         for version in (threshold - 1, threshold):
             for file, text in start.items():
                 example.capability_file(file, text)
-            diffs[version] = example.upgrade(version).diffs
-        if diffs[threshold - 1] == diffs[threshold]:
+            diffs.append(example.upgrade(version).diffs)
+        if diffs[0] == diffs[1]:
             complain(f"{name} changes no capability file of the example", [])
-        lines += [f"An upgrade from {threshold - 1}:", *diffs[threshold - 1].splitlines()]
+        lines += [f"An upgrade from {threshold - 1}:", *diffs[0].splitlines()]
     accepts("capability-files.diff", "the changed capability files differ", lines)
