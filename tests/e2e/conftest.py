@@ -14,6 +14,7 @@ import socket
 import sqlite3
 import subprocess
 import tempfile
+import time
 from contextlib import closing, contextmanager
 from dataclasses import dataclass
 from pathlib import Path
@@ -154,6 +155,14 @@ class Appliance:
             for path in self.caps.glob("*")
             if path.is_file() and not path.is_symlink()
         }
+
+
+def wait_until(condition):
+    for _ in range(6000):
+        if condition():
+            return
+        time.sleep(0.01)
+    pytest.fail("nothing happens for a minute")
 
 
 @contextmanager

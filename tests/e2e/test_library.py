@@ -6,6 +6,7 @@ import time
 from subprocess import Popen
 
 import pytest
+from conftest import wait_until
 
 
 def test_configuration_is_attached_from_start_to_end(appliance):
@@ -62,8 +63,7 @@ def test_lines_stay_whole_and_in_order_while_the_log_is_rotated(appliance):
     logs = []
     for rotation in range(10):
         time.sleep(0.2)
-        while not appliance.log_file.exists():
-            time.sleep(0.001)
+        wait_until(appliance.log_file.exists)
         logs.append(appliance.log_file.rename(f"{appliance.log_file}.{rotation}"))
     for writer in writers:
         writer.kill()

@@ -7,11 +7,10 @@ import shutil
 import signal
 import sqlite3
 import subprocess
-import time
 from contextlib import closing
 
 import pytest
-from conftest import show
+from conftest import show, wait_until
 
 # Names and values of all kinds, which a trigger changes in turn.
 AWKWARD = r"""
@@ -177,8 +176,7 @@ def test_a_signal_leaves_nothing_behind(preview):
     command = preview.command(preview.example.database, 0)
     preview.set_tool(f"touch {started}; exec sleep 60")
     with subprocess.Popen(command, env=preview.environment) as process:
-        while not started.exists():
-            time.sleep(0.01)
+        wait_until(started.exists)
         process.send_signal(signal.SIGTERM)
     assert process.returncode == -signal.SIGTERM
     assert not os.listdir(preview.temporary)
