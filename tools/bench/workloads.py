@@ -1,108 +1,127 @@
-"""Runs the workloads of the table, and their peers."""
+"""Makes databases and files, and runs the tool, the library and their peers on them."""
 
 import collections
+import itertools
 import json
 import os
 import re
+import shutil
+import sqlite3
 import statistics
 import subprocess
-import sys
 import time
+from pathlib import Path
 
-from .inputs import (
-    CAPS,
-    DATABASE,
-    FILES,
-    ROOT,
-    TOOL,
-    WORK,
-    fresh_database,
-    make_cameras,
-    make_files,
-)
-from .inputs import make_settings, open_example, transactions
-from .table import ROWS, Cost
+from .table import SIZES
 
-CALLS = str(ROOT / "build/bench/tools/bench/calls")
-PREVIEW = ROOT / "build/bench/preview/tessel-preview"
-SIZES = {100: 21, 1000: 15, 10000: 11, 200000: 7}  # cameras, and how often they are upgraded
+ROOT = Path(__file__).resolve().parents[2]
+BUILD = ROOT / "build/bench"
+TOOL = BUILD / "main/tesselupgrader"
+CALLS = BUILD / "tools/bench/calls"
+TARGET = Path("/var/packages/Camveld/target")
+DATABASE = TARGET / "system.db"
+START = Path("/var/start.db")  # what is copied to DATABASE before each run
+FILES = Path("/var/files")
+RESULT = Path("/var/result")  # of a program that measures another
 # Not /dev/null: some programs do less when their output goes there.
-OUTPUT = [(os.POSIX_SPAWN_OPEN, 1, "/var/output", os.O_WRONLY | os.O_CREAT | os.O_TRUNC, 0o600)]
+OUTPUT = [(os.POSIX_SPAWN_OPEN, 1, "/var/out", os.O_WRONLY | os.O_CREAT | os.O_TRUNC, 0o600)]
 
 
 def run(command):
-    """Returns a command's wall and user time in seconds."""
+    """Returns a command's wall and user time in seconds, and its peak memory in KiB."""
+    # wait4() returns at least this program's own memory. That of GNU time is smaller.
+    timed = ["time", "-f", "%M", "-o", RESULT, *command]
     start = time.perf_counter()
-    pid = os.posix_spawnp(command[0], command, os.environ, file_actions=OUTPUT)
+    pid = os.posix_spawnp(timed[0], timed, os.environ, file_actions=OUTPUT)
     _, status, usage = os.wait4(pid, 0)
     wall = time.perf_counter() - start
     if status != 0:
-        sys.exit(f"bench: {command}: status {os.waitstatus_to_exitcode(status)}")
-    return wall, usage.ru_utime
-
-
-def memory(command):
-    """Returns a command's peak memory in KiB. wait4() would tell this program's own, which the
-    system counts to each command that it starts; GNU time is smaller than any of them."""
-    run(["time", "-f", "%M", "-o", WORK / "memory", *command])
-    return int((WORK / "memory").read_text())
-
-
-def syncs(command):
-    run(["strace", "-fqq", "-e", "trace=fsync,fdatasync", "-o", WORK / "syncs", *command])
-    return (WORK / "syncs").read_text().count("\n")
+        raise subprocess.CalledProcessError(os.waitstatus_to_exitcode(status), command)
+    return {"wall": wall, "user": usage.ru_utime, "memory": int(RESULT.read_text())}
 
 
 def interleave(commands, rounds, prepare=lambda: None):
-    """Runs the named commands in turn, so that what else the machine does falls on all of them.
-    Returns the medians of each."""
+    """Runs the named commands in turn, and returns the medians of each."""
     runs = {name: [] for name in commands}
     for _ in range(rounds):
         for name, command in commands.items():
             prepare()
             runs[name].append(run(command))
-    medians = {name: map(statistics.median, zip(*times)) for name, times in runs.items()}
-    return {name: dict(zip(("wall", "user"), times)) for name, times in medians.items()}
+    return {
+        name: {figure: statistics.median(run[figure] for run in done) for figure in done[0]}
+        for name, done in runs.items()
+    }
 
 
-def upgrade(count, rounds, changes):
-    make_cameras(count, changes)
-    script, lines = WORK / "script", WORK / "upgrade.sql"
-    script.write_text("".join(f'sqlite3 {DATABASE} "{change}"\n' for change in changes))
-    lines.write_text("\n".join(changes))
+def system_calls(command, which="!%memory"):
+    """Returns how often the command makes each of them."""
+    strace = ["strace", "-fc", "-U", "calls,name", "-e", which, "-o", RESULT, *command]
+    subprocess.run(strace, check=True)
+    counts = re.findall(r"^ *(\d+) (?!total)(\w+)$", RESULT.read_text(), re.MULTILINE)
+    return collections.Counter({name: int(count) for count, name in counts})
+
+
+def instructions(command):
+    valgrind = ["valgrind", "-q", "--tool=callgrind", f"--callgrind-out-file={RESULT}", *command]
+    subprocess.run(valgrind, check=True)
+    return int(re.search(r"^totals: (\d+)", RESULT.read_text(), re.MULTILINE)[1])
+
+
+def make_cameras(count):
+    """Makes START of so many cameras of 600 bytes. An upgrade changes 30 % of them."""
+    START.unlink(missing_ok=True)
+    database = sqlite3.connect(START, isolation_level=None)
+    database.executescript((ROOT / "examples/appliance.sql").read_text())
+    kind = "SELECT * FROM camera WHERE name = ? AND model <> 'A8105-E' ORDER BY id"
+    changing = itertools.cycle(database.execute(kind, ["changes"]).fetchall())
+    staying = itertools.cycle(database.execute(kind, ["must stay"]).fetchall())
+    database.executescript("BEGIN; DELETE FROM camera")
+    for row in range(count):
+        _, *values = next(changing if row % 10 < 3 else staying)
+        database.execute(f"INSERT INTO camera VALUES (?{',?' * len(values)})", (row, *values))
+    database.execute("UPDATE camera SET motion_area = zeroblob(345)")
+    database.execute("COMMIT")
+    database.close()
+
+
+def fresh_database():
+    """Brings START back. No run waits until it is on stable storage."""
+    shutil.copyfile(START, DATABASE)
+    os.sync()
+
+
+def make_files(count, text, directory=FILES):
+    """Makes so many capability files of some 40 lines, with the text in the middle of each."""
+    shutil.rmtree(directory, ignore_errors=True)
+    directory.mkdir()
+    lines = "".join(f"resolution_{line} = 1920x1080,1280x720\n" for line in range(18))
+    for number in range(count):
+        (directory / f"{number:05}").write_text(lines + text + lines)
+
+
+def make_settings():
+    """Makes what the library's calls read and change, also with the group that GKeyFile needs."""
+    lines = "".join(f"camera{line}=the setting of {line}\n" for line in range(1000, 2000))
+    Path("/var/settings").write_text(lines)
+    Path("/var/settings.ini").write_text("[settings]\n" + lines)
+
+
+def upgrade(count, rounds):
+    actions = (ROOT / "tests/expected/actions.txt").read_text()
+    texts = re.findall(r"^\* (.*(?:\n  .*)*)", actions, re.MULTILINE)
+    # Without the cameras that make_cameras() leaves out: they have transactions of their own.
+    changes = [f"BEGIN;{text};COMMIT;" for text in texts if not re.match("INSERT|.* id=", text)]
     commands = {
         "ours": [TOOL, "0"],
-        "one sqlite3": ["sqlite3", DATABASE, f".read {lines}"],
-        "script": ["sh", "-e", script],
+        "one sqlite3": ["sqlite3", DATABASE, *changes],
+        "script": ["sh", "-ec", "\n".join(f'sqlite3 {DATABASE} "{text}"' for text in changes)],
     }
+    make_cameras(count)
     found = interleave(commands, rounds, fresh_database)
     for name, command in commands.items():
-        for figure in memory, syncs:
-            fresh_database()
-            found[name][figure.__name__] = figure(command)
+        fresh_database()
+        found[name]["syncs"] = system_calls(command, "fsync,fdatasync").total()
     return found
-
-
-def preview(rounds):
-    """Of the database that was upgraded last."""
-    commands = {"ours": [PREVIEW, "--tool", TOOL, DATABASE, "0"], "upgrade": [TOOL, "0"]}
-    found = interleave(commands, rounds, fresh_database)
-    fresh_database()
-    found["ours"]["memory"] = memory(commands["ours"])
-    return {**found, "64 MiB": {"memory": 64 * 1024}}
-
-
-def unchanged_files():
-    make_files(10000, FILES, "pan= continuous\nptz_speed_max = 1\n", "audio = yes\nfov = 90\n")
-    others = ["grep", "-c", "=", "-r", FILES]
-    return interleave({"ours": [TOOL, "--updateCap", FILES], "grep -c": others}, 9)
-
-
-def changed_files():
-    sed = ["sed", "-i", "-E", r"s/^(pan|tilt) = yes/\1= step/", "{}", "+"]
-    others = ["find", FILES, "-type", "f", "-exec", *sed]
-    commands = {"ours": [TOOL, "--updateCap", FILES], "sed -i": others}
-    return interleave(commands, 9, lambda: make_files(2000, FILES, "pan = yes\ntilt = yes\n"))
 
 
 def library_calls():
@@ -111,8 +130,6 @@ def library_calls():
     command = [CALLS, *(f"--benchmark_{option}" for option in options.split())]
     found = collections.defaultdict(dict)
     for timed in json.loads(subprocess.check_output(command))["benchmarks"]:
-        if "error_message" in timed:
-            sys.exit(f"bench: {timed['name']}: {timed['error_message']}")
         if timed.get("aggregate_name") == "median":
             call, way = timed["run_name"].split("/")
             found[call][way] = {"wall": timed["real_time"] / 1e9}
@@ -120,60 +137,35 @@ def library_calls():
 
 
 def measure():
-    """Returns the figures of each workload's ways."""
-    changes = transactions()
+    """Returns the figures of each workload, by the ways in which it is done."""
     found = {}
     for count, rounds in SIZES.items():
-        found[f"upgrade of {count} cameras"] = upgrade(count, rounds, changes)
-    if PREVIEW.exists():
-        found[f"preview of {count} cameras"] = preview(rounds)
-    else:
-        print(f"bench: there is no {PREVIEW} to measure", file=sys.stderr)
-    found["10000 unchanged capability files"] = unchanged_files()
-    found["2000 changed capability files"] = changed_files()
+        found[f"upgrade of {count} cameras"] = upgrade(count, rounds)
+    preview = [BUILD / "preview/tessel-preview", "--tool", TOOL, DATABASE, "0"]
+    ways = {"ours": preview, "upgrade": [TOOL, "0"]}
+    found[f"preview of {count} cameras"] = interleave(ways, rounds, fresh_database)
+    ours = [TOOL, "--updateCap", FILES]
+    make_files(10000, "pan= continuous\nptz_speed_max = 1\n")
+    ways = {"ours": ours, "grep -c": ["grep", "-c", "=", "-r", FILES]}
+    found["10000 unchanged capability files"] = interleave(ways, 9)
+    sed = rf"sed -i -E 's/^(pan|tilt) = yes/\1= step/' {FILES}/*"
+    ways = {"ours": ours, "sed -i": ["sh", "-c", sed]}
+    text = "pan = yes\ntilt = yes\n"
+    found["2000 changed capability files"] = interleave(ways, 9, lambda: make_files(2000, text))
     return {**found, **library_calls()}
 
 
-# --- What no load of the machine changes ---
-
-
-def prepare_counting():
-    """Makes three cameras and nine files that the actions counted change."""
-    database = open_example(DATABASE)
-    database.execute("DELETE FROM camera")
-    camera = "INSERT INTO camera (vendor, model, resolution) VALUES ('ABUS', 'TVIP62000', ?)"
-    database.executemany(camera, [["QVGA"], ["VGA"], ["UXGA"]])
-    database.close()
-    make_files(9, CAPS, "pan= continuous\ntilt = no\n")
-    make_settings()
-    time.sleep(0.1)  # the tool does not trust what it remembers of a file of this very moment
-
-
-def system_calls(command):
-    """Returns how often each is made, but for those that manage memory."""
-    prepare_counting()
-    strace = ["strace", "-fc", "-U", "calls,name", "-e", "trace=!%memory", "-o", WORK / "calls"]
-    subprocess.run([*strace, *command], check=True)
-    counts = re.findall(r"^ *(\d+) (?!total)(\w+)$", (WORK / "calls").read_text(), re.M)
-    return collections.Counter({name: int(count) for count, name in counts})
-
-
-def instructions(command):
-    prepare_counting()
-    valgrind = ["valgrind", "--tool=callgrind", f"--callgrind-out-file={WORK}/callgrind"]
-    subprocess.run([*valgrind, *command], check=True, stderr=subprocess.DEVNULL)
-    return int(re.search(r"^totals: (\d+)", (WORK / "callgrind").read_text(), re.M)[1])
-
-
-def costs():
-    """Yields each row that has a budget, its cost and its system calls: what one run costs that
-    does the thing once more than another."""
-    # The versions from which one action more runs: TVIP62000's resolutions, PTZ speed.
-    versions = {"one database action": (83, 82), "one capability-file action": (80, 79)}
-    for row in filter(lambda row: row.budget, ROWS):
-        once, twice = ([CALLS, "--times", times, row.workload] for times in "12")
-        if row.workload in versions:
-            once, twice = ([TOOL, str(version)] for version in versions[row.workload])
-        calls = system_calls(twice) - system_calls(once)
-        syncs = calls["fsync"] + calls["fdatasync"]
-        yield row, Cost(calls.total(), syncs, instructions(twice) - instructions(once)), calls
+def count(workload):
+    """Returns the system calls and instructions of doing it once more."""
+    # An upgrade from the lower version runs one action more.
+    arguments = {"one database action": "83 82", "one capability-file action": "80 79"}
+    program = [TOOL] if workload in arguments else [CALLS, f"{workload}/ours"]
+    counted = []
+    for argument in arguments.get(workload, "1 2").split():
+        for tool in system_calls, instructions:
+            make_cameras(3)  # TVIP62000, the example's first, which the counted action changes
+            fresh_database()
+            make_files(9, "pan= continuous\ntilt = no\n", TARGET / "@camveld/@KICapInfo")
+            make_settings()
+            counted.append(tool([*program, argument]))
+    return counted[2] - counted[0], counted[3] - counted[1]
