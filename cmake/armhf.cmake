@@ -1,5 +1,5 @@
 # Toolchain for the appliance: ARMv7-A with hardware floating point. The cross compiler is Debian's.
-# scripts/bootstrap armhf unpacks the other packages for this processor into the sysroot.
+# scripts/bootstrap armhf unpacks the libraries for this processor into the sysroot.
 set(CMAKE_SYSTEM_NAME Linux)
 set(CMAKE_SYSTEM_PROCESSOR armv7l)
 set(CMAKE_LIBRARY_ARCHITECTURE arm-linux-gnueabihf)
@@ -13,5 +13,5 @@ set(CMAKE_FIND_ROOT_PATH_MODE_INCLUDE ONLY)
 # Search the host too: an installed build of this project may be outside the sysroot.
 set(CMAKE_FIND_ROOT_PATH_MODE_PACKAGE BOTH)
 
-# In the cache, where the tests of programs find it.
+# The end-to-end tests read this from the cache.
 set(CMAKE_CROSSCOMPILING_EMULATOR ${TESSEL_ROOT}/tools/run-armhf CACHE FILEPATH "")

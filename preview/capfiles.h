@@ -4,13 +4,13 @@
 #include <string>
 #include <vector>
 
-// Copies the regular files of a directory, and those that its links lead to: nothing else can hold
-// keys. Throws Failure, as the others do.
+// Copies the regular files of a directory, and those that its links point to. Only they can contain
+// keys. All functions here throw Failure.
 void CopyCapFiles(const std::string& strFrom, const std::string& strTo);
 
-// The names of files whose text differs between two directories.
+// Returns the names of the files whose text differs between two directories.
 std::vector<std::string> ChangedFiles(const std::string& strBefore, const std::string& strAfter);
 
-// Runs diff(1) with further options on two files.
+// Returns what diff(1) prints for two files. Options are added to its own.
 std::string Diff(const std::vector<std::string>& Options, const std::string& strFrom,
                  const std::string& strTo);

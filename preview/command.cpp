@@ -41,7 +41,7 @@ void ReadRecords(int SyslogFd, std::vector<std::string>* pRecords) {
   }
 }
 
-// Reads until the program and all it has started have closed their end.
+// Reads until the program and all its children have closed their end of the pipe.
 void Collect(int OutputFd, int SyslogFd, CommandResult* pResult) {
   char rgBuf[16384];
   while (true) {

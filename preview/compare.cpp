@@ -47,7 +47,7 @@ void ReadColumns(const Database& Db, TableInfo* pTable) {
   }
 }
 
-// Leaves the keys empty when columns hide all names of the rowid.
+// Leaves the keys empty if columns hide all names of the rowid.
 void ReadKeys(const Database& Db, TableInfo* pTable) {
   for (const char* szName : {"rowid", "_rowid_", "oid"}) {
     if (pTable->blHasRowid && pTable->Keys.empty() && FindColumn(*pTable, szName) == -1) {
@@ -63,7 +63,7 @@ void ReadKeys(const Database& Db, TableInfo* pTable) {
   }
 }
 
-// Keys and columns under an alias, as TableRow has them.
+// SQL: the keys and columns of the table strAlias, in the order that TableRow expects.
 std::string Selected(const TableInfo& Table, const std::string& strAlias) {
   std::string strSql;
   for (const std::string& strKey : Table.Keys) {
@@ -83,7 +83,7 @@ std::string SameKeys(const TableInfo& Table) {
   return strSql.substr(5);
 }
 
-// A key is never NULL: where it is, there is no such row.
+// Keys are never NULL. If the key of the joined row is NULL, there is no such row.
 void CompareKept(const Database& Db, const TableInfo& Table, ChangeSink* pSink) {
   const std::string strName = Quoted(Table.strName);
   Statement Rows(Db, "SELECT " + Selected(Table, "b") + ", " + Selected(Table, "a") +
@@ -130,7 +130,7 @@ void CompareTable(const Database& Db, const ListedTable& Listed, ChangeSink* pSi
     CompareKept(Db, Table, pSink);
     CompareAdded(Db, Table, pSink);
   } catch (const SqlFailure& Reason) {
-    // A collation or a function that only the recorder has.
+    // The table uses a collation or a function that only the recorder has.
     if (Reason.Code() != SQLITE_ERROR) {
       throw;
     }

@@ -1,4 +1,4 @@
-// What differs between two states of a database. Memory does not grow with its tables.
+// Compares two states of a database. The memory that this needs does not grow with the tables.
 #pragma once
 
 #include <string>
@@ -8,16 +8,16 @@
 
 struct ColumnInfo {
   std::string strName;
-  bool blGenerated;  // it follows from others and cannot be set
+  bool blGenerated;  // computed from other columns: cannot be set
 };
 
 struct TableInfo {
   std::string strName;
   std::vector<ColumnInfo> Columns;
-  // What a row is known by: a name of its rowid, or the columns of its primary key.
+  // What identifies a row: a name of its rowid, or the columns of its primary key.
   std::vector<std::string> Keys;
   bool blHasRowid = false;
-  int Vendor = -1;  // columns that name a camera, in the table of cameras
+  int Vendor = -1;  // the columns that name a camera; -1 in other tables
   int Model = -1;
 };
 
@@ -38,17 +38,17 @@ class TableRow {
   const int m_First;
 };
 
-// Receives the differences, table by table.
+// Receives the differences, table by table. Ignores those whose function is not overridden.
 class ChangeSink {
  public:
   virtual ~ChangeSink() = default;
-  virtual void Cell(const TableRow& Before, const TableRow& After, size_t Column) = 0;
-  virtual void Added(const TableRow& After) = 0;
-  virtual void Removed(const TableRow& Before) = 0;
+  virtual void Cell(const TableRow& /*Before*/, const TableRow& /*After*/, size_t /*Column*/) {}
+  virtual void Added(const TableRow& /*After*/) {}
+  virtual void Removed(const TableRow& /*Before*/) {}
   // strWhat is "view" or "virtual table", or the reason.
-  virtual void NotCompared(const std::string& strTable, const std::string& strWhat) = 0;
+  virtual void NotCompared(const std::string& /*strTable*/, const std::string& /*strWhat*/) {}
 };
 
-// Compares the database attached as "after" with "main". SQLite's own table of the highest row
-// numbers goes to pBookkeeping alone, which may be null. Throws SqlFailure.
+// Compares the database attached as "after" with "main". Only pBookkeeping, which may be null,
+// receives the changes of sqlite_sequence, SQLite's own table. Throws SqlFailure.
 void Compare(const Database& Db, ChangeSink* pSink, ChangeSink* pBookkeeping);

@@ -7,7 +7,7 @@
 
 #include "failure.h"
 
-// What SQLite says, with its result code.
+// An error of SQLite: its message and result code.
 class SqlFailure : public Failure {
  public:
   SqlFailure(int Code, const std::string& strWhat) : Failure(strWhat), m_Code(Code) {}
@@ -21,7 +21,7 @@ class SqlFailure : public Failure {
 // A connection, for one thread. All functions throw SqlFailure.
 class Database {
  public:
-  // Flags as sqlite3_open_v2 takes them.
+  // Flags are those of sqlite3_open_v2.
   Database(const std::string& strName, int Flags);
   ~Database() { sqlite3_close(m_pDb); }
   Database(const Database&) = delete;
@@ -42,9 +42,9 @@ class Statement {
   Statement& operator=(const Statement&) = delete;
   sqlite3_stmt* Get() const { return m_pStatement; }
   void Bind(int Parameter, const std::string& strText);
-  // Whether there is a further row.
+  // Goes to the next row. Returns false if there is none.
   bool Step();
-  // A column of the row, NULL as "".
+  // Returns a column of the row; "" for NULL.
   std::string Text(int Column) const;
   int Int(int Column) const { return sqlite3_column_int(m_pStatement, Column); }
 
@@ -53,5 +53,5 @@ class Statement {
   sqlite3_stmt* m_pStatement = nullptr;
 };
 
-// An identifier in double quotes.
+// Returns an identifier in double quotes.
 std::string Quoted(const std::string& strName);

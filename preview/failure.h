@@ -1,4 +1,4 @@
-// Why no preview can be made.
+// The error that ends a preview.
 #pragma once
 
 #include <cerrno>
@@ -6,13 +6,13 @@
 #include <stdexcept>
 #include <string>
 
-// Ends the preview with status 2; what() is the one line that the user reads.
+// main() prints what() in one line and ends with status 2.
 class Failure : public std::runtime_error {
  public:
   using std::runtime_error::runtime_error;
 };
 
-// A failure of a system call: strWhat names the file and the step, the reason comes from errno.
+// Describes a failed system call. strWhat names the file and the step; errno gives the reason.
 inline Failure SystemFailure(const std::string& strWhat) {
   const int Errno = errno;
   return Failure(strWhat + ": " + strerror(Errno));

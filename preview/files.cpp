@@ -18,7 +18,7 @@ struct DirCloser {
   void operator()(DIR* pDir) const { closedir(pDir); }
 };
 
-// Reads at most Size bytes; 0 at the end.
+// Reads at most Size bytes. Returns 0 at the end of the file.
 size_t ReadSome(int Fd, const std::string& strFile, char* pBuf, size_t Size) {
   ssize_t Len;
   do {

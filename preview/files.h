@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-// Owns a descriptor, or none (-1).
+// Owns a descriptor. -1 means none.
 class Descriptor {
  public:
   explicit Descriptor(int Fd = -1) : m_Fd(Fd) {}
@@ -20,26 +20,26 @@ class Descriptor {
   int m_Fd;
 };
 
-// Opens a file; O_CLOEXEC is added to the flags.
+// Opens a file, with O_CLOEXEC added to the flags.
 int OpenFile(const std::string& strFile, int Flags, mode_t Mode = 0);
 
 bool Exists(const std::string& strFile);
 bool IsDirectory(const std::string& strFile);
 
-// The name of a file in a directory.
+// Returns the path of a file in a directory.
 inline std::string FileIn(const std::string& strDir, const std::string& strName) {
   return strDir + "/" + strName;
 }
 
-// The names in a directory but "." and "..", in the order of their bytes.
+// Returns the names in a directory without "." and "..", sorted by their bytes.
 std::vector<std::string> ListDirectory(const std::string& strDir);
 
 std::string ReadWholeFile(const std::string& strFile);
 
-// Creates a file of that text.
+// Creates a file with this text.
 void WriteFile(const std::string& strFile, const std::string& strText);
 
-// Copies what the descriptor reads from its start to a new file.
+// Copies the file behind From, from its start, to the new file strTo. Messages call it strFrom.
 void CopyTo(int From, const std::string& strFrom, const std::string& strTo, mode_t Mode);
 
 void SyncFile(const std::string& strFile);

@@ -1,4 +1,4 @@
-// Shows what an upgrade would change, by running the tool on a copy of the appliance.
+// Runs the tool on a copy of the appliance and shows what it changes there.
 
 #include <fcntl.h>
 #include <unistd.h>
@@ -24,7 +24,7 @@ namespace {
 constexpr int WOULD_CHANGE = 3;
 constexpr int NO_PREVIEW = 2;
 
-// Names of files in the work directory, which is the working directory.
+// Paths in the work directory, which is the current directory.
 constexpr const char* BEFORE_DATABASE = "before.db";
 constexpr const char* AFTER_DATABASE = "target/system.db";
 constexpr const char* BEFORE_CAPS = "before";
@@ -32,7 +32,7 @@ constexpr const char* AFTER_CAPS = "after";
 constexpr const char* UNDO_SQL = "undo.sql";
 constexpr const char* UNDO_PATCH = "undo.patch";
 
-// Passes each change on to all of its sinks.
+// Passes each change on to several sinks.
 class FanOut : public ChangeSink {
  public:
   void Add(ChangeSink* pSink) { m_Sinks.push_back(pSink); }
@@ -66,7 +66,7 @@ bool HasColour() {
   return isatty(STDOUT_FILENO) == 1 && (szNoColour == nullptr || *szNoColour == '\0');
 }
 
-// Null for --check, which prints nothing.
+// Returns null for --check, which prints nothing.
 std::unique_ptr<Report> MakeReport(OutputMode Mode) {
   switch (Mode) {
     case OutputMode::TEXT:
@@ -82,7 +82,7 @@ std::unique_ptr<Report> MakeReport(OutputMode Mode) {
 
 // --- Steps of a preview ---
 
-// SQLite rolls back or takes in what a crash of the recorder left beside the database.
+// Reading lets SQLite roll back the journal, or apply the log, that a crash of the recorder left.
 void Recover(const std::string& strCopy) {
   Database(strCopy, SQLITE_OPEN_READWRITE).Execute("SELECT count(*) FROM sqlite_schema");
 }
@@ -145,7 +145,7 @@ void ReportFailures(const UpgradeRun& Upgrade, Report* pReport, Tally* pTally) {
 }
 
 int ListActions(const CommandLine& Options) {
-  // Without a database every action fails, and the log names it.
+  // There is no database here, so every action fails and the log names it.
   const UpgradeRun Upgrade =
       Tool(Options.strTool, Options.strOwnProgram, "target").Upgrade(Options.strVersion);
   for (const FailedAction& Action : Upgrade.Failures) {
@@ -192,13 +192,13 @@ int PreviewUpgrade(const CommandLine& Options) {
 
 // --- Failures ---
 
-// What SQLite's own check says first of the copy of a database.
+// Returns the first error that SQLite's own check finds in the copy of the database.
 std::string FirstDamage() {
   try {
     const Database Db(BEFORE_DATABASE, SQLITE_OPEN_READWRITE);
     Statement Check(Db, "PRAGMA integrity_check(1)");
     std::string strDamage = Check.Step() ? Check.Text(0) : "";
-    if (strDamage.compare(0, 3, "***") == 0) {  // a line that names the database
+    if (strDamage.compare(0, 3, "***") == 0) {  // the first line names the database
       strDamage = strDamage.substr(strDamage.find('\n') + 1);
     }
     return strDamage.substr(0, strDamage.find('\n'));

@@ -88,7 +88,7 @@ void Print(CommandLine* pOptions, const char* szText) {
   pOptions->blDone = true;
 }
 
-// The capability files beside the database are looked at when they are there.
+// By default, compares the capability files beside the database, if there are any.
 void FindCaps(CommandLine* pOptions) {
   const bool blBeside = pOptions->strCaps.empty();
   if (blBeside) {
@@ -103,7 +103,7 @@ void FindCaps(CommandLine* pOptions) {
   }
 }
 
-// Files are named as from the root: a preview has a working directory of its own.
+// Makes all paths absolute, because a preview changes to a directory of its own.
 void CompleteNames(CommandLine* pOptions) {
   for (std::string* pFile :
        {&pOptions->strDatabase, &pOptions->strCaps, &pOptions->strTool, &pOptions->strUndoDir}) {

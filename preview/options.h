@@ -8,12 +8,12 @@ enum class OutputMode { TEXT, SUMMARY, JSON, LIST, CHECK };
 struct CommandLine {
   OutputMode Mode = OutputMode::TEXT;
   std::string strDatabase;
-  std::string strCaps;     // empty: the capability files are not looked at
-  std::string strTool;     // empty: to be looked for
-  std::string strUndoDir;  // empty: no way back is written
+  std::string strCaps;     // empty: do not compare capability files
+  std::string strTool;     // empty: search for the tool
+  std::string strUndoDir;  // empty: write no way back
   std::string strVersion;
-  std::string strOwnProgram;  // the file, which an emulator knows only before the first chdir
-  bool blDone = false;        // --help or --version: everything is printed
+  std::string strOwnProgram;  // found before the first chdir, as an emulator needs
+  bool blDone = false;        // --help or --version was printed
 };
 
 // Reads the command line. Throws Failure.

@@ -13,7 +13,7 @@ constexpr const char* PLAIN = "\033[0m";
 
 void Print(const std::string& strText) { fwrite(strText.data(), 1, strText.size(), stdout); }
 
-// A name of a table, column or file, which could otherwise end the line.
+// Escapes control characters in a name of a table, column or file: they would break the line.
 std::string Name(const std::string& strName) {
   std::string strShown;
   for (const char Char : strName) {
@@ -23,7 +23,7 @@ std::string Name(const std::string& strName) {
   return strShown;
 }
 
-// "camera 12", with a primary key of several columns "TABLE 'a', 2".
+// "camera 12". If the primary key has several columns: "TABLE 'a', 2".
 std::string RowName(const TableRow& Row) {
   const TableInfo& Table = Row.Table();
   std::string strName = Name(Table.strName) + " ";
@@ -58,7 +58,7 @@ void Tally::Cell(const TableRow& Before, const TableRow& /*After*/, size_t /*Col
     ++m_OtherCells;
     return;
   }
-  // The cells of a row come one after the other.
+  // All changed cells of a row arrive together.
   const int64_t Camera = sqlite3_value_int64(Before.Key(0));
   m_Cameras += m_CameraCells == 0 || Camera != m_LastCamera ? 1 : 0;
   m_LastCamera = Camera;
@@ -69,26 +69,11 @@ void Tally::Added(const TableRow& /*After*/) { ++m_Added; }
 
 void Tally::Removed(const TableRow& /*Before*/) { ++m_Removed; }
 
-void Tally::NotCompared(const std::string& /*strTable*/, const std::string& /*strWhat*/) {}
-
 bool Tally::IsEmpty() const {
   return m_CameraCells + m_OtherCells + m_Added + m_Removed == 0 && m_Files <= 0;
 }
 
 // --- Summary ---
-
-void SummaryReport::Cell(const TableRow& /*Before*/, const TableRow& /*After*/, size_t /*Column*/) {
-}
-
-void SummaryReport::Added(const TableRow& /*After*/) {}
-
-void SummaryReport::Removed(const TableRow& /*Before*/) {}
-
-void SummaryReport::NotCompared(const std::string& /*strTable*/, const std::string& /*strWhat*/) {}
-
-void SummaryReport::File(const std::string& /*strName*/, const std::string& /*strDiff*/) {}
-
-void SummaryReport::Failed(const FailedAction& /*Failed*/) {}
 
 void SummaryReport::Summary(const Tally& Counts) {
   printf("%" PRId64 " cells in %" PRId64 " cameras, %" PRId64 " other cells, %" PRId64
@@ -142,7 +127,6 @@ void TextReport::Failed(const FailedAction& Failed) {
 
 namespace {
 
-// Joins with commas what is not "".
 std::string JsonMember(const char* szName, const std::string& strJson) {
   return std::string(",\"") + szName + "\":" + strJson;
 }
@@ -151,7 +135,7 @@ void PrintObject(const char* szChange, const std::string& strMembers) {
   Print(std::string("{\"change\":\"") + szChange + "\"" + strMembers + "}\n");
 }
 
-// The table, and the rowid or an array of the primary key's values.
+// The name of the table, and the rowid or an array of the primary key's values.
 std::string JsonRowName(const TableRow& Row) {
   const TableInfo& Table = Row.Table();
   std::string strKey = Json(Row.Key(0));

@@ -1,4 +1,4 @@
-// What a preview prints.
+// The output of a preview.
 #pragma once
 
 #include <cstdint>
@@ -14,7 +14,6 @@ class Tally : public ChangeSink {
   void Cell(const TableRow& Before, const TableRow& After, size_t Column) override;
   void Added(const TableRow& After) override;
   void Removed(const TableRow& Before) override;
-  void NotCompared(const std::string& strTable, const std::string& strWhat) override;
   bool IsEmpty() const;
 
   int64_t m_CameraCells = 0;
@@ -22,35 +21,29 @@ class Tally : public ChangeSink {
   int64_t m_OtherCells = 0;
   int64_t m_Added = 0;
   int64_t m_Removed = 0;
-  int64_t m_Files = -1;  // not looked at
-  int64_t m_Failed = 0;  // actions
-  int m_Status = 0;      // the tool's
+  int64_t m_Files = -1;  // capability files that change; -1 if none were compared
+  int64_t m_Failed = 0;  // failed actions
+  int m_Status = 0;      // the exit status of the tool
 
  private:
   int64_t m_LastCamera = 0;
 };
 
-// Prints each change as it comes.
+// Prints each change when it arrives.
 class Report : public ChangeSink {
  public:
-  virtual void File(const std::string& strName, const std::string& strDiff) = 0;
-  virtual void Failed(const FailedAction& Failed) = 0;
+  virtual void File(const std::string& /*strName*/, const std::string& /*strDiff*/) {}
+  virtual void Failed(const FailedAction& /*Failed*/) {}
   virtual void Summary(const Tally& Counts) = 0;
 };
 
-// The summary alone, for a person.
+// Prints the summary only, as text.
 class SummaryReport : public Report {
  public:
-  void Cell(const TableRow& Before, const TableRow& After, size_t Column) override;
-  void Added(const TableRow& After) override;
-  void Removed(const TableRow& Before) override;
-  void NotCompared(const std::string& strTable, const std::string& strWhat) override;
-  void File(const std::string& strName, const std::string& strDiff) override;
-  void Failed(const FailedAction& Failed) override;
   void Summary(const Tally& Counts) override;
 };
 
-// Everything, for a person.
+// Prints everything as text.
 class TextReport : public SummaryReport {
  public:
   explicit TextReport(bool blColour) : m_blColour(blColour) {}
@@ -68,7 +61,7 @@ class TextReport : public SummaryReport {
   const bool m_blColour;
 };
 
-// Everything, as JSON Lines: an object a change.
+// Prints everything as JSON Lines, one object per change.
 class JsonReport : public Report {
  public:
   void Cell(const TableRow& Before, const TableRow& After, size_t Column) override;

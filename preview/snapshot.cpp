@@ -1,9 +1,9 @@
-// A connection of SQLite's own would roll back a journal that a crash left, and create or remove
-// the files of a write-ahead log. So:
-// - Without other users of a write-ahead log, the bytes of the database and of what belongs to it
-//   are copied under the lock of a reader, and SQLite recovers the copy.
-// - With them, the log and the database change all the time, and SQLite reads them through shared
-//   memory that it cannot write.
+// An ordinary connection would roll back a journal that a crash left, and would create or remove
+// the files of a write-ahead log. So there are two ways:
+// - If no other process uses a write-ahead log, copy the bytes of the database and of its journal
+//   or log under a reader's lock. SQLite then recovers the copy.
+// - If one does, log and database may change at any time. Let SQLite read them, with read-only
+//   shared memory.
 #include "snapshot.h"
 
 #include <fcntl.h>
@@ -22,7 +22,7 @@ namespace {
 constexpr int BUSY_TIMEOUT_MSEC = 5000;
 constexpr int RETRY_MSEC = 10;
 
-// Where SQLite locks a database, in its file format.
+// The bytes that SQLite locks in a database file.
 constexpr off_t PENDING_BYTE = 0x40000000;
 constexpr off_t SHARED_FIRST = PENDING_BYTE + 2;
 constexpr off_t SHARED_SIZE = 510;
@@ -53,7 +53,7 @@ bool TryLockShared(int Fd) {
   throw Failure(strDatabase + ": another process has held the database locked for five seconds");
 }
 
-// Locks out everybody who would write to the database file. The lock goes with the descriptor.
+// Keeps others from writing to the database file until the descriptor is closed.
 void LockShared(int Fd, const std::string& strDatabase) {
   for (int Waited = 0; !TryLockShared(Fd); Waited += RETRY_MSEC) {
     if (errno != EAGAIN && errno != EACCES && errno != EINTR) {
@@ -79,7 +79,7 @@ bool IsUnchanged(const struct stat& A, const struct stat& B) {
          A.st_mtim.tv_nsec == B.st_mtim.tv_nsec;
 }
 
-// One that is not there, or no longer, is not needed.
+// A file that does not exist, or no longer, is not needed.
 void CopyIfThere(const std::string& strFrom, const std::string& strTo) {
   const Descriptor From(open(strFrom.c_str(), O_RDONLY | O_CLOEXEC));
   if (From.Get() != -1) {
@@ -89,13 +89,13 @@ void CopyIfThere(const std::string& strFrom, const std::string& strTo) {
   }
 }
 
-// SQLite would remove the log of an empty database, which cannot be in use.
+// An empty database cannot be in use. SQLite would remove its log.
 bool IsLogInUse(const std::string& strDatabase, const struct stat& Stat) {
   return Stat.st_size > 0 && Exists(strDatabase + "-wal") && Exists(strDatabase + "-shm");
 }
 
-// Copies the bytes. Returns false when a user of a write-ahead log, whom the lock does not keep
-// from writing, has come meanwhile.
+// Copies the bytes. Returns false if another process has begun to use a write-ahead log meanwhile:
+// the lock does not keep it from writing.
 bool CopyBytes(int Fd, const std::string& strDatabase, const std::string& strCopy) {
   const struct stat Before = Status(Fd, strDatabase);
   CopyTo(Fd, strDatabase, strCopy, 0600);
@@ -124,7 +124,7 @@ std::string ReadOnlyUri(const std::string& strDatabase) {
   return strUri + "?readonly_shm=1";
 }
 
-// Copies in one read transaction, which sees the write-ahead log.
+// Copies in one read transaction, so that the copy includes the write-ahead log.
 void Backup(const std::string& strDatabase, const std::string& strCopy) {
   Database From(ReadOnlyUri(strDatabase), SQLITE_OPEN_READONLY | SQLITE_OPEN_URI);
   sqlite3_busy_timeout(From.Get(), BUSY_TIMEOUT_MSEC);

@@ -14,7 +14,7 @@
 
 namespace {
 
-// Makes all signals that would end the process wait, except those that the caller ignores.
+// Blocks and returns SIGCHLD and the signals that would end this process.
 sigset_t BlockSignals() {
   sigset_t Signals;
   sigemptyset(&Signals);
@@ -41,8 +41,7 @@ std::string MakeWorkDir() {
   return strDir;
 }
 
-// Waits for the child's end or for a signal, which the child then does not survive. Returns the
-// signal, or 0.
+// Waits for the child to end. Kills it if a signal arrives. Returns that signal, or 0.
 int WaitForChild(pid_t Child, const sigset_t& Signals, int* pStatus) {
   int Caught = 0;
   while (waitpid(Child, pStatus, WNOHANG) != Child) {
@@ -53,7 +52,8 @@ int WaitForChild(pid_t Child, const sigset_t& Signals, int* pStatus) {
       kill(Child, SIGKILL);
     }
   }
-  // What the child started dies with it, and is handed to this process (not by all emulators).
+  // Descendants of the child die with it and become children of this process. Some emulators do
+  // not hand them over.
   while (wait(nullptr) != -1 || errno == EINTR) {
   }
   return Caught;

@@ -24,7 +24,7 @@ std::string FirstLine(const std::string& strText) { return strText.substr(0, str
 
 // --- Where the programs are ---
 
-// Installed it is in libexec; a build tree is build/PRESET of the source tree.
+// Looks in libexec, for an installed program, and in tools/, for one in build/PRESET.
 std::string FindHelper(const std::string& strOwnDir) {
   for (const char* szPlace : {"/../libexec/tesselupgrader/", "/../../../tools/"}) {
     std::string strHelper = strOwnDir + szPlace + "private-appliance";
@@ -36,7 +36,7 @@ std::string FindHelper(const std::string& strOwnDir) {
                 "/../libexec/tesselupgrader");
 }
 
-// The first bytes of a program, which say what processor it is for; a script has none.
+// Returns the bytes of an ELF header that identify the processor; "" for a script.
 std::string Processor(const std::string& strProgram) {
   char rgHead[20] = "";
   std::ifstream(strProgram, std::ios::binary).read(rgHead, sizeof(rgHead));
@@ -77,7 +77,7 @@ std::string FindTool(const std::string& strOwnProgram, const std::string& strOwn
 
 // --- What a run tells ---
 
-// A datagram socket that the tool's syslog goes to.
+// Makes the datagram socket that receives the tool's syslog messages.
 int BindSyslog(const std::string& strName) {
   sockaddr_un Address = {};
   Address.sun_family = AF_UNIX;
@@ -93,7 +93,7 @@ int BindSyslog(const std::string& strName) {
   return Fd;
 }
 
-// The close in between keeps the system from reporting several openings as one.
+// Watches closings, too: otherwise the kernel merges openings that follow each other.
 int WatchOpenings(const std::string& strDir) {
   const int Fd = inotify_init1(IN_CLOEXEC | IN_NONBLOCK);
   if (Fd == -1 || inotify_add_watch(Fd, strDir.c_str(), IN_OPEN | IN_CLOSE) == -1) {
@@ -102,7 +102,7 @@ int WatchOpenings(const std::string& strDir) {
   return Fd;
 }
 
-// Openings of the directory itself: their events have no name.
+// Counts openings of the directory itself: their events have no name.
 int CountOpenings(int Fd) {
   alignas(inotify_event) char rgBuf[65536];
   int Count = 0;
@@ -117,7 +117,7 @@ int CountOpenings(int Fd) {
   return Count;
 }
 
-// The text between the last strBegin before the first strEnd, and that; "" if they are not there.
+// Returns the text before the first szEnd, back to the last szBegin; "" if one is missing.
 std::string Between(const std::string& strText, const char* szBegin, const char* szEnd) {
   const size_t End = strText.find(szEnd);
   const size_t Begin = End == std::string::npos ? End : strText.rfind(szBegin, End);
@@ -128,7 +128,7 @@ std::string Between(const std::string& strText, const char* szBegin, const char*
   return strText.substr(Start, End - Start);
 }
 
-// The log names the failed actions, in the order in which the executor has sent their reasons.
+// The log names the failed actions. Syslog has their reasons, in the same order.
 std::vector<FailedAction> FailedActions(const std::string& strLog,
                                         const std::vector<std::string>& Records) {
   std::vector<FailedAction> Failures;
@@ -149,7 +149,7 @@ std::vector<FailedAction> FailedActions(const std::string& strLog,
   return Failures;
 }
 
-// A file that could not be read or replaced: the record has its name, the step and errno.
+// The record of a file that could not be read or replaced has its name, the step and errno.
 void AddFailedFiles(const std::vector<std::string>& Records, std::vector<FailedAction>* pFailed) {
   for (const std::string& strRecord : Records) {
     const std::string strFile = Between(strRecord, "zamoc: [", "]: ");
@@ -183,7 +183,7 @@ Tool::Tool(const std::string& strTool, const std::string& strOwnProgram,
   std::filesystem::create_directories(CapDir());
 }
 
-// Without arguments the tool prints its name and version, and how to call it.
+// Without arguments, the tool prints its name and version, then its usage.
 std::string Tool::Describe() const {
   const CommandResult Result = RunCommand({m_strHelper, m_strTarget, m_strTool});
   if (Result.Status != 1) {

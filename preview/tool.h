@@ -1,11 +1,11 @@
-// tesselupgrader, run unmodified on a copy of the appliance.
+// Runs the unmodified tesselupgrader on a copy of the appliance.
 #pragma once
 
 #include <string>
 #include <vector>
 
 struct FailedAction {
-  std::string strName;  // of the action, or "capability file NAME"
+  std::string strName;  // the action, or "capability file NAME"
   std::string strReason;
   bool blFile;
 };
@@ -13,15 +13,15 @@ struct FailedAction {
 struct UpgradeRun {
   int Status = 0;  // 0 or 255
   std::vector<FailedAction> Failures;
-  int CapActions = 0;  // how many actions have looked at the capability directory
+  int CapActions = 0;  // how many actions have read the capability directory
 };
 
-// An appliance's directory: TARGET/system.db and TARGET/@camveld/@KICapInfo, with a log and a
-// syslog of its own. All functions throw Failure.
+// The tool, and the directory that it upgrades: TARGET/system.db and TARGET/@camveld/@KICapInfo,
+// with a log and a syslog of their own. All functions throw Failure.
 class Tool {
  public:
-  // Runs strTool, or the newest tool of this processor among those installed and built beside this
-  // program when it is empty, on the directory strTarget, which must exist.
+  // Uses strTool on the existing directory strTarget. If strTool is empty, uses the newest tool for
+  // this processor that is installed or built beside this program.
   Tool(const std::string& strTool, const std::string& strOwnProgram, const std::string& strTarget);
 
   // "tesselupgrader VERSION (FILE)".

@@ -12,8 +12,8 @@
 
 namespace {
 
-// Triggers and foreign keys did what they do when the upgrade ran: the cells they changed are among
-// those set back.
+// The script disables triggers and foreign keys. They acted during the upgrade already, and it sets
+// back the cells that they changed, too.
 constexpr const char* BEGIN_SQL =
     "--\n"
     "--     sqlite3 system.db <system.db.sql\n"
@@ -34,7 +34,7 @@ bool IsBookkeeping(const TableInfo& Table) { return Table.strName == "sqlite_seq
 
 std::string UndoTable(size_t Idx) { return "tessel_undo_" + std::to_string(Idx); }
 
-// Whether the column has the value, of the same type.
+// SQL: true if the column has this value and type.
 std::string Holds(const std::string& strColumn, const std::string& strValue) {
   return strColumn + " IS " + strValue + " COLLATE BINARY AND typeof(" + strColumn + ") = typeof(" +
          strValue + ")";
@@ -49,7 +49,7 @@ std::string HasKeys(const TableRow& Row) {
   return strSql;
 }
 
-// Whether the row has all its values.
+// SQL: true if a row with these keys has all values of Row.
 std::string HasRow(const TableRow& Row) {
   std::string strSql = HasKeys(Row);
   for (size_t Column = 0; Column < Row.Table().Columns.size(); ++Column) {
@@ -104,7 +104,7 @@ void UndoScript::Cell(const TableRow& Before, const TableRow& After, size_t Colu
   Write("INSERT INTO temp." + UndoTable(m_Tables.size() - 1) + " VALUES (" + strValues + ");\n");
 }
 
-// strDone: that there was nothing to do, because the row is as before the upgrade already.
+// strDone is SQL. It is true if the row is as before the upgrade already.
 void UndoScript::WriteState(const TableRow& Row, const std::string& strDone) {
   if (!IsBookkeeping(Row.Table())) {
     Write("INSERT INTO temp.tessel_undo SELECT CASE WHEN changes() THEN 1 WHEN " + strDone +
@@ -135,8 +135,6 @@ void UndoScript::Removed(const TableRow& Before) {
         strValues.substr(2) + " WHERE NOT " + Exists(Before, HasKeys(Before)) + ";\n");
   WriteState(Before, Exists(Before, HasRow(Before)));
 }
-
-void UndoScript::NotCompared(const std::string& /*strTable*/, const std::string& /*strWhat*/) {}
 
 void UndoScript::WriteColumn(size_t Idx, size_t Column) {
   const TableInfo& Table = m_Tables[Idx];
@@ -191,7 +189,7 @@ UndoDirectory::UndoDirectory(const std::string& strDir) : m_strDir(strDir) {
 
 UndoDirectory::~UndoDirectory() {
   if (m_blMade) {
-    rmdir(m_strDir.c_str());  // one that has files stays
+    rmdir(m_strDir.c_str());  // fails if it has files
   }
 }
 

@@ -8,8 +8,8 @@
 
 #include "compare.h"
 
-// Writes a script for the sqlite3 shell that sets every cell and row back which is still as the
-// upgrade left it, in one transaction, and says how many those were.
+// Writes a script for the sqlite3 shell. In one transaction, the script sets back every cell and
+// row that still is as the upgrade left it, and prints how many it has set back.
 class UndoScript : public ChangeSink {
  public:
   // Throws Failure, as Close does.
@@ -17,8 +17,7 @@ class UndoScript : public ChangeSink {
   void Cell(const TableRow& Before, const TableRow& After, size_t Column) override;
   void Added(const TableRow& After) override;
   void Removed(const TableRow& Before) override;
-  void NotCompared(const std::string& strTable, const std::string& strWhat) override;
-  // Writes the end: the cells are set back when all rows are there again.
+  // Writes the end of the script. It sets the cells back, after the rows before it are restored.
   void Close();
 
  private:
@@ -28,12 +27,12 @@ class UndoScript : public ChangeSink {
 
   const std::string m_strFile;
   std::unique_ptr<FILE, int (*)(FILE*)> m_pFile;
-  std::vector<TableInfo> m_Tables;           // that cells have changed in
-  std::vector<std::vector<bool>> m_Columns;  // of each of them, which ones
+  std::vector<TableInfo> m_Tables;           // tables with changed cells
+  std::vector<std::vector<bool>> m_Columns;  // for each such table: which columns have changed
 };
 
-// A new directory for the way back, or one that is there and empty. It disappears again unless it
-// is given all its files.
+// The directory with the way back: a new one, or an existing empty one. The destructor removes a
+// new one that is still empty.
 class UndoDirectory {
  public:
   // Throws Failure, as Deliver does.
@@ -41,7 +40,7 @@ class UndoDirectory {
   ~UndoDirectory();
   UndoDirectory(const UndoDirectory&) = delete;
   UndoDirectory& operator=(const UndoDirectory&) = delete;
-  // Copies a file into the directory: it has its name when it is complete and on stable storage.
+  // Copies a file into the directory. It gets its name once it is complete and on stable storage.
   void Deliver(const std::string& strFrom, const std::string& strName);
 
  private:

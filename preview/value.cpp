@@ -13,7 +13,7 @@ namespace {
 
 bool IsPrintable(char Char) { return Char >= 0x20 && Char <= 0x7e; }
 
-// The shortest decimal number that is read back as this one.
+// Returns the shortest decimal number that reads back as Real.
 std::string ShownReal(double Real) {
   char szReal[40];
   for (int Digits = 15; Digits <= 17; ++Digits) {
@@ -26,8 +26,9 @@ std::string ShownReal(double Real) {
   return strReal.find_first_of(".eni") == std::string::npos ? strReal + ".0" : strReal;
 }
 
-// SQLite reads few digits and small exponents exactly. Where the processor has no wider number, it
-// may read others as a neighbour: these are a product of a whole number and powers of two.
+// SQLite reads numbers with few digits and small exponents exactly. On a processor without wider
+// floating-point numbers, it may read others inexactly. Those are written as a whole number
+// multiplied or divided by powers of two.
 std::string SqlReal(double Real) {
   if (std::isinf(Real)) {
     return Real > 0 ? "9e999" : "-9e999";
@@ -49,7 +50,7 @@ std::string SqlReal(double Real) {
   return strReal + ")";
 }
 
-// The length of the character that the text goes on with, or 0 when its bytes are not UTF-8.
+// Returns the length of the first character, or 0 if its bytes are not UTF-8.
 size_t CharacterSize(const unsigned char* pByte, size_t Left) {
   const unsigned Lead = pByte[0];
   const size_t Size = Lead < 0x80 ? 1 : Lead < 0xc2 ? 0 : Lead < 0xe0 ? 2 : Lead < 0xf0 ? 3 : 4;
@@ -94,7 +95,7 @@ bool IsSame(sqlite3_value* pA, sqlite3_value* pB) {
   if (Type == SQLITE_FLOAT) {
     return sqlite3_value_double(pA) == sqlite3_value_double(pB);
   }
-  // In this order: the size is that of the bytes got last.
+  // Fetch the bytes first: SQLite gives the size of what was fetched last.
   const void* pBytesA = sqlite3_value_blob(pA);
   const void* pBytesB = sqlite3_value_blob(pB);
   const int Size = sqlite3_value_bytes(pA);
@@ -155,7 +156,7 @@ std::string SqlLiteral(sqlite3_value* pValue) {
     return SqlReal(sqlite3_value_double(pValue));
   }
   if (Type == SQLITE_INTEGER && sqlite3_value_int64(pValue) == INT64_MIN) {
-    return "(-9223372036854775807 - 1)";  // without its sign it would be a real number
+    return "(-9223372036854775807 - 1)";  // SQLite reads 9223372036854775808 as a real number
   }
   if (Type != SQLITE_TEXT) {
     return Shown(pValue);

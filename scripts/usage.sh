@@ -1,8 +1,8 @@
 # shellcheck shell=bash
-# The scripts source this file first. It answers --help with the header of the script and ends.
+# Each script sources this file first. For --help it prints the header of the script and exits.
 [[ ${1-} != --help ]] || exec sed -n '2,/^[^#]/s/^# \?//p' "$0"
 
-# Reports that the script does not know ARGUMENT, and ends it: refuse ARGUMENT
+# refuse ARGUMENT: reports an unknown argument and exits.
 refuse() {
   printf '%s: unknown argument: %s (see %s --help)\n' "${0##*/}" "'$1'" "$0" >&2
   exit 2

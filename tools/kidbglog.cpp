@@ -1,5 +1,4 @@
-// Shows and changes what the processes of the package log, in the configuration that all of them
-// share.
+// Shows and changes the shared configuration that decides what the processes of the package log.
 
 #include <fcntl.h>
 #include <getopt.h>
@@ -39,10 +38,10 @@ constexpr char USAGE[] =
     "A CATEGORY and a LEVEL are a name or a number; show --all lists the categories.\n"
     "Levels: 0 alarm, 1 error, 2 warn, 3 notice, 4 info, 5 debug, 6 debug2, 7 debug3.\n";
 
-// The exit status, beside 0.
+// The exit statuses other than 0.
 enum ExitStatus : int { REFUSED = 1, MISUSED = 2 };
 
-// Says in one line what is wrong, and ends the program.
+// Prints one line to standard error and ends the program.
 [[noreturn]] __attribute__((format(printf, 2, 3))) void Fail(ExitStatus Status,
                                                              const char* szFormat, ...) {
   fputs("kidbglog: ", stderr);
@@ -56,7 +55,7 @@ enum ExitStatus : int { REFUSED = 1, MISUSED = 2 };
 
 // --- Names ---
 
-// How many characters must be inserted, deleted or replaced to get from one text to the other.
+// Returns how many insertions, deletions and replacements turn one text into the other.
 size_t EditDistance(const std::string& strFrom, const std::string& strTo) {
   std::vector<size_t> Row(strTo.size() + 1);
   std::iota(Row.begin(), Row.end(), 0);
@@ -71,7 +70,8 @@ size_t EditDistance(const std::string& strFrom, const std::string& strTo) {
   return Row.back();
 }
 
-// The one of the Total values of T that has the name or the number strText.
+// Returns the value of T, below Total, whose name or number is strText. Ends the program if none
+// is.
 template <typename T>
 T Parse(const char* szKind, const std::string& strText, T Total) {
   size_t NearestDistance = std::min<size_t>(3, (strText.size() + 1) / 2) + 1;
@@ -94,7 +94,7 @@ LOG_LEVEL ParseLevel(const std::string& strText) {
   return Parse("level", strText, LOG_LEVEL_TOTAL);
 }
 
-// Another program may have stored a number that no level has.
+// Another program may have stored a number that is not a level.
 std::string LevelText(LOG_LEVEL Level) {
   return Level >= 0 && Level < LOG_LEVEL_TOTAL ? Enum2String(Level) : itos(Level);
 }
@@ -131,7 +131,7 @@ bool HasEntry(const KiDbgLogCfg& Cfg, pid_t Pid) {
 
 bool IsRunning(pid_t Pid) { return Pid > 0 && (kill(Pid, 0) == 0 || errno == EPERM); }
 
-// A process chooses its name freely: bytes that a terminal would obey are replaced.
+// Replaces control characters: a process can choose a name that would control the terminal.
 std::string ProcessName(pid_t Pid) {
   char szName[64] = "?";
   if (FILE* pFile = fopen(("/proc/" + itos(Pid) + "/comm").c_str(), "re")) {
@@ -147,7 +147,7 @@ std::string ProcessName(pid_t Pid) {
 
 // --- The commands ---
 
-using WordList = std::vector<std::string>;  // what follows the command's name
+using WordList = std::vector<std::string>;  // the arguments of a command
 
 void Print(bool blAll) {
   const KiDbgLogCfg& Cfg = Attach();
@@ -251,7 +251,8 @@ void Create(const WordList& /*Words*/) {
   }
   KiDbgLogCfg& Cfg = Attach();
   Cfg.Init(KiShmDbgLogIPCKey());
-  // Init does not tell whether it could read the settings. Without the directory there are none.
+  // Init does not report whether it could read the settings. ENOENT: the directory is missing, so
+  // there are none.
   if (Cfg.LoadDbgLogSettings() < 0 && errno != ENOENT) {
     Fail(REFUSED, "created with the defaults, cannot read %s: %s", SETTINGS_FILE, strerror(errno));
   }
@@ -294,9 +295,9 @@ const CommandRow& FindCommand(const std::string& strName, const WordList& Words)
   Fail(MISUSED, "no command '%s', see 'kidbglog --help'", strName.c_str());
 }
 
-// Keeps other commands away until the end of the program. The configuration has no lock of its own:
-// of two processes that are added at the same moment, one would be lost. A user who may not open
-// the directory goes without.
+// Keeps other kidbglog commands waiting until this program ends. The configuration has no lock of
+// its own, so one of two processes that are added at the same moment would be lost. If the user may
+// not open the directory, there is no lock.
 void Lock() {
   const int Fd = open(PACKAGE_DIR, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
   if (Fd != -1 && KiFlock::Lock(Fd, -1, true) != 0) {
@@ -325,7 +326,7 @@ int main(int argc, char* argv[]) {
       case 'V':
         puts("kidbglog " VERSION);
         return 0;
-      default:  // getopt_long has said what is wrong
+      default:  // getopt_long has printed the reason
         return MISUSED;
     }
   }
