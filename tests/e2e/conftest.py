@@ -1,10 +1,4 @@
-"""What the tests of programs share: an appliance of their own to run them on.
-
-    def test_siemens_changes_its_name(example):
-        result = example.upgrade(0)
-        assert result.status == 0
-        assert "camera 7 (Siemens CCMS2025) vendor: 'Siemens' -> 'SIEMENS'" in result.changes
-"""
+"""What the tests of programs share: an appliance of their own to run them on."""
 
 import difflib
 import os
