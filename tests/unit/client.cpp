@@ -29,37 +29,9 @@ static void WriteLines() {
   }
 }
 
-// Writes a configuration with a value in every field to a file.
-static int Fill(const char* szFile) {
-  KiDbgLogCfg Cfg = {};
-  Cfg.SetLogInMs(true);
-  for (int Idx = 0; Idx < LOG_CATEG_MAX; ++Idx) {
-    Cfg.SetLogLevel(static_cast<LOG_CATEG>(Idx), static_cast<LOG_LEVEL>(Idx));
-    Cfg.SetPidLevel(4000000 + Idx, static_cast<LOG_LEVEL>(-Idx));
-  }
-  FILE* pFile = fopen(szFile, "w");
-  return fwrite(&Cfg, sizeof(Cfg), 1, pFile) == 1 && fclose(pFile) == 0 ? 0 : 1;
-}
-
-static int Show(const char* szFile) {
-  KiDbgLogCfg Cfg;
-  FILE* pFile = fopen(szFile, "r");
-  const size_t Read = fread(&Cfg, sizeof(Cfg), 1, pFile);
-  fclose(pFile);
-  printf(" %d", Cfg.LogInMs());
-  for (int Idx = 0; Idx < LOG_CATEG_MAX; ++Idx) {
-    printf(" %d %d", Cfg.GetLogLevel(static_cast<LOG_CATEG>(Idx)), Cfg.GetPidLevel(4000000 + Idx));
-  }
-  return Read == 1 ? 0 : 1;
-}
-
 // create | log CATEG LEVEL | loop CATEG LEVEL | write | get FILE KEY | set FILE KEY VALUE
-// fill FILE | show FILE
 int main(int /*argc*/, char** argv) {
   const std::string strCommand = argv[1];
-  if (strCommand == "fill" || strCommand == "show") {
-    return strCommand == "fill" ? Fill(argv[2]) : Show(argv[2]);
-  }
   PrintAttached();
   if (strCommand == "create") {
     const int Id = shmget(KiShmDbgLogIPCKey(), sizeof(KiDbgLogCfg), IPC_CREAT | 0666);
