@@ -38,7 +38,7 @@ CLONE_NEWNS = 0x20000
 
 def kills():
     """At each system call that can change something, and at some others."""
-    for number, call in enumerate(appliance.calls):
+    for number, call in enumerate(appliance.calls, 1):
         if number % 25 == 0 or re.match(CHANGES, call.line):
             yield call.name, CAPS in call.line
 
