@@ -47,7 +47,7 @@ def failures(result):
 
 
 def upgrade_without(example, number):
-    """Upgrades while the database cannot be opened the N-th time, or never when N is 0."""
+    """Upgrades while the N-th opening of the database fails."""
     inject = f"inject=openat:error=EIO:when={number}"
     options = ["-f", "--seccomp-bpf", "-o", "/dev/null", "-e", "trace=openat", "-e", inject]
     return example.upgrade(0, under=["strace", *options, "-P", example.database])
