@@ -3,7 +3,6 @@
 
 #include <fileutils.h>
 #include <kidebuglog.h>
-#include <sys/shm.h>
 #include <unistd.h>
 
 #include <cstdio>
@@ -29,22 +28,15 @@ static void WriteLines() {
   }
 }
 
-// create | log CATEG LEVEL | loop CATEG LEVEL | write | get FILE KEY | set FILE KEY VALUE
+// loop CATEG LEVEL | write | get FILE KEY | set FILE KEY VALUE
 int main(int /*argc*/, char** argv) {
   const std::string strCommand = argv[1];
   PrintAttached();
-  if (strCommand == "create") {
-    const int Id = shmget(KiShmDbgLogIPCKey(), sizeof(KiDbgLogCfg), IPC_CREAT | 0666);
-    KiShmDbgLogCfgAt()->Init(KiShmDbgLogIPCKey());
-    return Id == -1;
-  }
-  if (strCommand == "log" || strCommand == "loop") {
+  while (strCommand == "loop") {
     const auto Categ = static_cast<LOG_CATEG>(std::stoi(argv[2]));
     const auto Level = static_cast<LOG_LEVEL>(std::stoi(argv[3]));
-    do {
-      KIDBGLOG(Categ, Level, "x\n");
-    } while (strCommand == "loop" && usleep(10000) == 0);
-    return 0;
+    KIDBGLOG(Categ, Level, "x\n");
+    usleep(10000);
   }
   if (strCommand == "write") {
     static KiDbgLogCfg Cfg = {};
