@@ -5,7 +5,6 @@
 #include <sys/mount.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
-#include <syslog.h>
 #include <unistd.h>
 
 #include <filesystem>
@@ -35,12 +34,11 @@ inline std::vector<unsigned> Rights(const char* szPath) {
   return {Stat.st_mode, Stat.st_uid, Stat.st_gid};
 }
 
-// The text of the log, without times, process and thread ids and line numbers.
+// The text of the log, without times, process ids and line numbers.
 inline std::string LogText() {
-  static const std::regex Prefix(
-      R"(^\w{3} [ \d]\d [\d:]{8}(\.\d{3})? \[\d+\](\[\d+\])? ?([^:\n]*:)-?\d+:)",
-      std::regex::ECMAScript | std::regex::multiline);
-  return std::regex_replace(ReadFile(LOG_FILE), Prefix, "$3");
+  static const std::regex Prefix(R"(^\w{3} [ \d]\d [\d:]{8} \[\d+\] ?([^:\n]*:)\d+:)",
+                                 std::regex::ECMAScript | std::regex::multiline);
+  return std::regex_replace(ReadFile(LOG_FILE), Prefix, "$1");
 }
 
 // Each test starts with the empty directories of an appliance.
@@ -54,8 +52,8 @@ class PrivateVar : public ::testing::Test {
       fs::create_directories(std::string("/var/") + szDir);
     }
     WriteFile(SYSTEM_DB, "");
+    umask(0);
     const rlimit Descriptors = {40, 40};  // too few for a call in a loop that leaves one open
     setrlimit(RLIMIT_NOFILE, &Descriptors);
-    openlog("syslog", LOG_PERROR, LOG_USER);  // to standard error too, where it can be captured
   }
 };
