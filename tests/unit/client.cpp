@@ -16,10 +16,7 @@ static struct Global {
   ~Global() { PrintAttached(); }
 } gGlobal;
 
-__attribute__((destructor(101))) static void AtTheVeryEnd() {
-  PrintAttached();
-  fflush(stdout);
-}
+__attribute__((destructor(101))) static void AtTheVeryEnd() { PrintAttached(); }
 
 // Lines of a number and some zeros, until the process is killed.
 static void WriteLines() {

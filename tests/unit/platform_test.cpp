@@ -41,6 +41,7 @@ TEST_F(CapabilityFile, LinesAreReadAndChanged) {
       {"k = \"a \"\r\n", "2 a ", "k= new\n"},
       {"k=\"\"a\"\"", "3 \"a\"", "k= new\n"},
       {"k=\"\n", "1 \"", "k= new\n"},
+      {"k=\"a\n", "2 \"a", "k= new\n"},
       {"a=\0\nk=12345678\n"s, "8 1234567", "a=\0\nk= new\n"s},
   };
   for (const auto& Case : rgCase) {
