@@ -1,135 +1,214 @@
-"""The example appliance: its runs, and what a disturbed one may leave."""
+"""The example appliance: its disk, its runs, and what they may leave."""
 
+import ast
 import re
 import shutil
 import sqlite3
 import subprocess
 from collections import Counter
 from contextlib import closing
+from functools import lru_cache
+from itertools import product
 from pathlib import Path
 from typing import NamedTuple
 
-from disk import CAPS, TARGET, cut_disks, model, read_disk, replay, write_disk
-
-TOOL = "build/release/main/tesselupgrader"
+TARGET = "/var/packages/Camveld/target"
+TOOL = ["build/release/main/tesselupgrader", "0"]
 DATABASE = "system.db"
+CAPS = "@camveld/@KICapInfo"
+LOG = Path("/var/log/camveld/camveld.log")
 TRACE = Path("/var/trace")
+LATEST = 16  # of more unsynced changes, the earlier ones are all there or none
+
+
+def read_disk():
+    paths = list(filter(Path.is_file, Path(TARGET).rglob("*")))
+    return {str(p.relative_to(TARGET)): p.read_bytes() for p in paths}
+
+
+def write_disk(disk, directory=TARGET):
+    shutil.rmtree(directory, ignore_errors=True)
+    for name, content in disk.items():
+        path = Path(directory, name)
+        path.parent.mkdir(parents=True, exist_ok=True)
+        path.write_bytes(content)
+
+
+class Model(NamedTuple):
+    files: dict  # by number: the synced content, and the changes since
+    listings: tuple  # numbers by name: when synced, and after each change
+
+    def live(self):
+        names = self.listings[-1].items()
+        return {name: changed(*self.files[number]) for name, number in names}
+
+    def cuts(self):
+        """The disks that a cut may leave. First, everything is there."""
+        for names in reversed(self.listings):
+            choices = [versions(*self.files[n]) for n in names.values()]
+            for contents in product(*choices):
+                yield dict(zip(names, contents))
+
+    def after(self, line):
+        """The model after a traced call."""
+        paths = re.findall(rf'[<"]{TARGET}/?([^>"]*)[>"]', line)
+        if not paths or "-shm" in paths[0] or " = -1 " in line:
+            return self
+        files, names, path = self.files, dict(self.listings[-1]), paths[0]
+        match line.split("(")[0]:
+            case "rename":
+                names[paths[1]] = names.pop(path)
+            case "unlink":
+                del names[path]
+            case "openat" if "O_CREAT" in line and path not in names:
+                names[path] = len(files)
+                files = files | {len(files): (b"", ())}
+            case "fsync" | "fdatasync" if path not in names:
+                # A directory. As a journal does, it stores all names.
+                return Model(files, (names,))
+            case call if path in names:
+                file = after(*files[names[path]], call, line)
+                return Model(files | {names[path]: file}, self.listings)
+            case _:
+                return self
+        return Model(files, (*self.listings, names))
+
+
+def after(synced, changes, call, line):
+    """A file after a traced call. A change is an offset and its data."""
+    match call:
+        case "fsync" | "fdatasync":
+            return changed(synced, changes), ()
+        case "write":  # only new files are written without an offset
+            offset = len(changed(synced, changes))
+        case "pwrite64" | "ftruncate":
+            offset = int(re.match(r".*, (\d+)\) += ", line)[1])
+        case _:
+            return synced, changes
+    string = re.search(r'"(?:[^"\\]|\\.)*"', line)
+    data = ast.literal_eval("b" + string[0]) if string else b""
+    return synced, (*changes, (offset, data))
+
+
+def changed(content, changes):
+    for offset, data in changes:
+        before = content[:offset].ljust(offset, b"\0")
+        # Without data, the file ends there.
+        rest = content[offset + len(data) :] if data else b""
+        content = before + data + rest
+    return content
+
+
+@lru_cache(maxsize=64)
+def versions(synced, changes):
+    """All, none, each, all but one of the changes, or the last one torn."""
+    choices = [changes, ()]
+    for place in range(max(0, len(changes) - LATEST), len(changes)):
+        others = changes[:place] + changes[place + 1 :]
+        choices += [changes[place : place + 1], others]
+    for offset, data in changes[-1:]:
+        ends = range(512 - offset % 512, len(data), 512)  # of sectors
+        choices += [(*changes[:-1], (offset, data[:end])) for end in ends]
+    return list(dict.fromkeys(changed(synced, choice) for choice in choices))
 
 
 class Call(NamedTuple):
     name: str  # and its number among the calls of this name, from 1
     line: str
-    state: tuple  # of the model, after the call
+    disk: Model  # after the call
     step: int  # the last step before it
 
 
-def run(*under):
-    """Runs the tool and returns its status."""
-    null = subprocess.DEVNULL
-    return subprocess.run([*under, TOOL, "0"], stdout=null, stderr=null, timeout=60).returncode
+def run(disk, *command):
+    """Runs a command on a disk. Returns its status and the disk it leaves."""
+    write_disk(disk)
+    LOG.parent.mkdir(parents=True, exist_ok=True)
+    LOG.unlink(missing_ok=True)
+    done = subprocess.run(command, capture_output=True, timeout=60)
+    return done.returncode, read_disk()
 
 
-def disturbed(start, call, what):
-    """Runs from the start with a call disturbed. Returns the status and the disk."""
-    write_disk(start)
+def disturb(disk, call, what):
+    """Runs the tool, and disturbs a call or, with a plus, all from there."""
     name, number = call.split()
     # The filter is faster, but signals do not come through it.
     fast = [] if "signal" in what else ["--seccomp-bpf", "-f"]
-    inject = [f"--trace={name}", f"--inject={name}:{what}:when={number}"]
-    status = run("strace", *fast, "-o", TRACE, *inject)
-    return status, read_disk()
+    when = number + "+" * what.endswith("+")
+    inject = f"--inject={name}:{what.rstrip('+')}:when={when}"
+    strace = ["strace", *fast, "-o", TRACE, f"--trace={name}", inject]
+    status, left = run(disk, *strace, *TOOL)
+    came = status == -9 or "INJECTED" in TRACE.read_text()
+    assert came, "the call did not come"
+    return status, left
 
 
-def record(disk, *command, recorder=False):
-    """Traces a run. Returns its calls, the rows after each transaction that changes some, and
-    the capability files between its actions."""
-    write_disk(disk)
-    if recorder:  # has the database open, so that nothing is moved from the log to it
-        database = sqlite3.connect(TARGET / DATABASE)
-        database.execute("SELECT count(*) FROM camera").fetchall()
-    strace = ["strace", "-y", "-s", "1000000", "-o", TRACE, *command]
-    subprocess.run(strace, check=True, stdout=subprocess.DEVNULL)
+def record(disk, *command):
+    """Returns a run's calls, and the rows and capability files it shows."""
+    strace = ["strace", "-qq", "-y", "-s", "1000000", "-o", TRACE]
+    status, end = run(disk, *strace, *command)
+    assert status == 0, f"{command} ended with {status}"
     calls, steps, versions = [], [rows(disk)], set()
-    state, count = model(disk), Counter()
+    files = {n: (content, ()) for n, content in enumerate(disk.values())}
+    model, count = Model(files, (dict(zip(disk, files)),)), Counter()
     for line in TRACE.read_text().splitlines():
+        model = model.after(line)
+        if re.match(f"close.*/{DATABASE}>", line):
+            now = rows(model.live())
+            steps += [now] if now != steps[-1] else []
+        if re.match(f'openat.*/{CAPS}", .*O_NONBLOCK|exit_group', line):
+            versions.update(capabilities(model.live()).items())
         name = line.split("(")[0]
         count[name] += 1
-        state = replay(state, line)
-        live = next(cut_disks(*state))
-        if re.match(rf"close.*/{DATABASE}>", line) and rows(live) != steps[-1]:
-            steps.append(rows(live))
-        if re.match(rf'openat.*/{CAPS}", .*O_NONBLOCK|exit_group', line):
-            versions.update(capability_files(live).items())
-        calls.append(Call(f"{name} {count[name]}", line, state, len(steps) - 1))
-    assert live.items() <= read_disk().items(), "the model is wrong"
+        step = len(steps) - 1
+        calls.append(Call(f"{name} {count[name]}", line, model, step))
+    assert model.live().items() <= end.items(), "the model is wrong"
     return calls, steps, versions
 
 
 def rows(disk):
     """The database as lines of SQL."""
-    # A copy, so that what there is to recover is left to the next run.
-    copy = Path("/var/copy")
-    shutil.rmtree(copy, ignore_errors=True)
-    copy.mkdir()
-    for name in {DATABASE, DATABASE + "-journal", DATABASE + "-wal"} & disk.keys():
-        (copy / name).write_bytes(disk[name].content)
-    with closing(sqlite3.connect(copy / DATABASE)) as database:
+    write_disk(disk, "/var/copy")
+    with closing(sqlite3.connect(f"/var/copy/{DATABASE}")) as database:
         integrity = database.execute("PRAGMA integrity_check").fetchall()
         assert integrity == [("ok",)], f"the database is damaged: {integrity}"
         return tuple(database.iterdump())
 
 
-def capability_files(disk):
-    return {name: file for name, file in disk.items() if name.startswith(CAPS)}
-
-
-def difference(lines, others):
-    return sorted(set(lines) ^ set(others))
+def capabilities(disk):
+    return {name: disk[name] for name in disk if name.startswith(CAPS)}
 
 
 class Appliance:
     def __init__(self, wal):
-        write_disk({})
-        with closing(sqlite3.connect(TARGET / DATABASE)) as database:
-            database.execute(f"PRAGMA journal_mode={'wal' if wal else 'delete'}")
-            database.executescript(Path("examples/appliance.sql").read_text())
-        shutil.copytree("examples/KICapInfo", TARGET / CAPS, dirs_exist_ok=True)
         self.wal = wal
+        shutil.copytree("examples/KICapInfo", f"{TARGET}/{CAPS}")
+        with closing(sqlite3.connect(f"{TARGET}/{DATABASE}")) as db:
+            db.execute(f"PRAGMA journal_mode={'wal' if wal else 'delete'}")
+            db.executescript(Path("examples/appliance.sql").read_text())
         self.start = read_disk()
-        # The second action on capability files alone, as after a failed first one.
-        second = record(self.start, TOOL, "70")[2]
-        self.calls, self.steps, first = record(self.start, TOOL, "0")
-        self.versions = first | second
-        self.lines = {call.name: call.line for call in self.calls}
-        self.end = read_disk()
-        self.failures = set()  # the rows after one failed transaction
-        self.checked = {}
+        self.calls, self.steps, self.versions = record(self.start, *TOOL)
+        # The second action on capability files alone, as after a failed first.
+        self.versions |= record(self.start, TOOL[0], "70")[2]
+        self.end = self.calls[-1].disk.live()
+        self.failures = []  # the rows after one failed transaction
 
     def check(self, left):
-        """Rows and files are whole, and a next run makes up. Returns the rows."""
-        # All of this depends on nothing but the disk, and many cases leave the same.
-        key = hash(frozenset(left.items()))
-        if key not in self.checked:
-            now = rows(left)
-            whole = now in self.steps or now in self.failures
-            near = min(self.steps, key=lambda step: len(difference(step, now)))
-            assert whole, f"no whole number of transactions: {difference(near, now)[:4]}"
-            parts = capability_files(left).items() - self.versions
-            parts = {name for name, _ in parts} & self.start.keys()
-            assert not parts, f"neither an old nor a new version: {parts}"
-            self.check_next_run(left, now)
-            self.checked[key] = now
-        return self.checked[key]
-
-    def check_next_run(self, left, now):
-        write_disk(left)
-        assert run() == 0, "the next run fails"
-        end = read_disk()
+        """Rows and files are whole, and a next run makes up. Returns rows."""
+        now = rows(left)
+        whole = now in self.steps or now in self.failures
+        near = min((set(step) ^ set(now) for step in self.steps), key=len)
+        assert whole, f"no whole number of transactions: {list(near)[:4]}"
+        parts = capabilities(left).items() - self.versions
+        parts = {name for name, _ in parts} & self.start.keys()
+        assert not parts, f"neither an old nor a new version: {parts}"
+        status, end = run(left, *TOOL)
+        assert status == 0, "the next run fails"
         # UpdateAxisA8105E adds its rows each time. After a failed action,
-        # UpdatePanasoniciPro2Panasonic renames cameras that the action has not changed.
+        # UpdatePanasoniciPro2Panasonic renames that action's cameras.
         known = "DO 2|sqlite_sequence" + "|Panasonic" * (now not in self.steps)
-        other = difference(rows(end), self.steps[-1])
+        other = set(rows(end)) ^ set(self.steps[-1])
         other = [line for line in other if not re.search(known, line)]
         assert not other, f"the next run comes to other rows: {other[:4]}"
         same = end | {DATABASE: None} == self.end | {DATABASE: None}
         assert same, f"the next run comes to other files: {list(end)}"
+        return now

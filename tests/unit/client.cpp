@@ -29,7 +29,7 @@ static void WriteLines() {
 int main(int /*argc*/, char** argv) {
   const std::string strCommand = argv[1];
   PrintAttached();
-  while (strCommand == "loop") {
+  for (int Time = 0; strCommand == "loop" && Time < 1000; ++Time) {
     const auto Categ = static_cast<LOG_CATEG>(std::stoi(argv[2]));
     const auto Level = static_cast<LOG_LEVEL>(std::stoi(argv[3]));
     KIDBGLOG(Categ, Level, "x\n");

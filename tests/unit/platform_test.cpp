@@ -52,14 +52,6 @@ TEST_F(CapabilityFile, LinesAreReadAndChanged) {
   }
 }
 
-TEST_F(CapabilityFile, KeysChangeTogether) {
-  const ZAMOCKeyChange rgChange[] = {
-      {"a", "x", "%s=\"%s\"\n"}, {"b", nullptr, nullptr}, {"c", "", "%s=%s\n"}};
-  WriteFile(FILE_NAME, "b=1\na=2\nd=3\na=4\nb=5\n");
-  EXPECT_EQ(ZAMOCFileChangeKeys(FILE_NAME, rgChange, 3), 0);
-  EXPECT_EQ(ReadFile(FILE_NAME), "a=\"x\"\nd=3\nc=\n");
-}
-
 TEST_F(CapabilityFile, WhatIsNotOneLineOfTheKeyIsRefused) {
   WriteFile(FILE_NAME, "k=1\n");
   for (const char* szFormat : {"%s=\n", "%s=%s%n\n", "%s=%s", "#%s=%s\n"}) {
@@ -72,12 +64,13 @@ TEST_F(CapabilityFile, WhatIsNotOneLineOfTheKeyIsRefused) {
 TEST_F(CapabilityFile, ReplacementHasTheOldOnesRights) {
   const char* const szOld = "/var/old";  // a second name of the old file
   WriteFile(FILE_NAME, "k=1\n");
-  WriteFile(LEFT_BEHIND, "k=1\n");
+  WriteFile(LEFT_BEHIND, "k=1\nof a killed process\n");
   static_cast<void>(!chown(FILE_NAME, 12, 34));  // an ordinary user may not
   chmod(FILE_NAME, 06741);
   fs::create_hard_link(FILE_NAME, szOld);
   EXPECT_EQ(Set(LEFT_BEHIND, "2"), -1);
   EXPECT_EQ(Set(FILE_NAME, "2"), 0);
+  EXPECT_EQ(ReadFile(FILE_NAME), "k= 2\n");
   EXPECT_EQ(ReadFile(szOld), "k=1\n");
   EXPECT_EQ(Rights(FILE_NAME), Rights(szOld));
 }

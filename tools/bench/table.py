@@ -2,16 +2,16 @@
 
 from typing import NamedTuple
 
-SIZES = {100: 21, 1000: 15, 10000: 11, 200000: 7}  # cameras: how often they are upgraded
+SIZES = {100: 21, 1000: 15, 10000: 11, 200000: 7}  # cameras: upgrades
 
 
 class Row(NamedTuple):
     workload: str
     figure: str = ""  # wall, memory or syncs
     peer: str = ""
-    goal: float = 0  # the most that the figure may be, in figures of the peer
+    goal: float = 0  # the most that it may be, in figures of the peer
     calls: int = 0  # to the system, of doing it once more
-    instructions: int = 0  # 5 % more are allowed, for other compilers and libraries
+    instructions: int = 0  # other compilers and libraries may take 5 % more
 
 
 ROWS = [

@@ -1,16 +1,16 @@
 """Makes the inputs, and runs the tool, the library and their peers on them."""
 
-import collections
-import itertools
 import json
 import os
 import re
 import shutil
 import sqlite3
-import statistics
 import subprocess
 import time
+from collections import Counter, defaultdict
+from itertools import cycle
 from pathlib import Path
+from statistics import median
 
 from .table import SIZES
 
@@ -18,70 +18,74 @@ ROOT = Path(__file__).resolve().parents[2]
 BUILD = ROOT / "build/bench"
 TOOL = BUILD / "main/tesselupgrader"
 CALLS = BUILD / "tools/bench/calls"
-TARGET = Path("/var/packages/Camveld/target")
-DATABASE = TARGET / "system.db"
+DATABASE = Path("/var/packages/Camveld/target/system.db")
 START = Path("/var/start.db")  # what is copied to DATABASE before each run
+CAPS = DATABASE.parent / "@camveld/@KICapInfo"
 FILES = Path("/var/files")
 RESULT = Path("/var/result")  # of a program that measures another
-# Not /dev/null: some programs do less when their output goes there.
-OUTPUT = [(os.POSIX_SPAWN_OPEN, 1, "/var/out", os.O_WRONLY | os.O_CREAT | os.O_TRUNC, 0o600)]
+
+UPGRADE = [TOOL, "0"]
+PREVIEW = [BUILD / "preview/tessel-preview", "--tool", TOOL, DATABASE, "0"]
+UPDATE_FILES = [TOOL, "--updateCap", FILES]
+GREP = ["grep", "-c", "=", "-r", FILES]
+SED = ["sh", "-c", rf"sed -i -E 's/^(pan|tilt) = yes/\1= step/' {FILES}/*"]
+# An upgrade from the version before runs one action more.
+ACTIONS = {"one database action": 83, "one capability-file action": 80}
 
 
 def run(command):
-    """Returns a command's wall and user time in seconds, and its peak memory in KiB."""
-    # wait4() returns at least this program's own memory. That of GNU time is smaller.
+    """Returns a command's wall time in seconds, and its peak memory in KiB."""
     timed = ["time", "-f", "%M", "-o", RESULT, *command]
-    start = time.perf_counter()
-    pid = os.posix_spawnp(timed[0], timed, os.environ, file_actions=OUTPUT)
-    _, status, usage = os.wait4(pid, 0)
-    wall = time.perf_counter() - start
-    if status != 0:
-        raise subprocess.CalledProcessError(os.waitstatus_to_exitcode(status), command)
-    return {"wall": wall, "user": usage.ru_utime, "memory": int(RESULT.read_text())}
+    # Not /dev/null: some programs do less when their output goes there.
+    with open("/var/out", "w") as output:
+        start = time.perf_counter()
+        subprocess.run(timed, stdout=output, check=True)
+        wall = time.perf_counter() - start
+    return {"wall": wall, "memory": int(RESULT.read_text())}
 
 
-def interleave(commands, rounds, prepare=lambda: None):
-    """Runs the named commands in turn, and returns the medians of each."""
-    runs = {name: [] for name in commands}
-    for _ in range(rounds):
-        for name, command in commands.items():
-            prepare()
-            runs[name].append(run(command))
+def interleave(ways, rounds, prepare=lambda: None):
+    """Runs the command of each way in turn, and returns their medians."""
+    runs = {way: [] for way in ways}
+    for way in [*ways] * rounds:
+        prepare()
+        runs[way].append(run(ways[way]))
     return {
-        name: {figure: statistics.median(run[figure] for run in done) for figure in done[0]}
-        for name, done in runs.items()
+        way: {name: median(run[name] for run in done) for name in done[0]}
+        for way, done in runs.items()
     }
 
 
 def system_calls(command, which="!%memory,getrandom"):
-    """Counts system calls, but not getrandom(): mkostemp() makes it by chance."""
-    strace = ["strace", "-fc", "-U", "calls,name", "-e", which, "-o", RESULT, *command]
-    subprocess.run(strace, check=True)
-    counts = re.findall(r"^ *(\d+) (?!total)(\w+)$", RESULT.read_text(), re.MULTILINE)
-    return collections.Counter({name: int(count) for count, name in counts})
+    """Counts calls, but not getrandom(): mkostemp() makes it by chance."""
+    strace = ["strace", "-fc", "-U", "calls,name", "-e", which, "-o", RESULT]
+    subprocess.run([*strace, *command], check=True)
+    counts = re.findall(r"(?m)^ *(\d+) (?!total)(\w+)$", RESULT.read_text())
+    return Counter({name: int(count) for count, name in counts})
 
 
 def instructions(command):
-    valgrind = ["valgrind", "-q", "--tool=callgrind", f"--callgrind-out-file={RESULT}", *command]
-    subprocess.run(valgrind, check=True)
-    return int(re.search(r"^totals: (\d+)", RESULT.read_text(), re.MULTILINE)[1])
+    callgrind = ["--tool=callgrind", f"--callgrind-out-file={RESULT}"]
+    subprocess.run(["valgrind", "-q", *callgrind, *command], check=True)
+    return int(re.search(r"(?m)^totals: (\d+)", RESULT.read_text())[1])
 
 
 def make_cameras(count):
-    """Makes START of so many cameras of 600 bytes. An upgrade changes 30 % of them."""
+    """Makes START, with cameras of 600 bytes. An upgrade changes 30 %."""
     START.unlink(missing_ok=True)
-    database = sqlite3.connect(START, isolation_level=None)
-    database.executescript((ROOT / "examples/appliance.sql").read_text())
-    kind = "SELECT * FROM camera WHERE name = ? AND model <> 'A8105-E' ORDER BY id"
-    changing = itertools.cycle(database.execute(kind, ["changes"]).fetchall())
-    staying = itertools.cycle(database.execute(kind, ["must stay"]).fetchall())
-    database.executescript("BEGIN; DELETE FROM camera")
+    db = sqlite3.connect(START)
+    db.executescript((ROOT / "examples/appliance.sql").read_text())
+    models = "SELECT * FROM camera WHERE name = ? AND model <> 'A8105-E'"
+    changing = cycle(db.execute(models, ["changes"]).fetchall())
+    staying = cycle(db.execute(models, ["must stay"]).fetchall())
+    db.execute("DELETE FROM camera")
     for row in range(count):
-        _, *values = next(changing if row % 10 < 3 else staying)
-        database.execute(f"INSERT INTO camera VALUES (?{',?' * len(values)})", (row, *values))
-    database.execute("UPDATE camera SET motion_area = zeroblob(345)")
-    database.execute("COMMIT")
-    database.close()
+        _, *camera = next(changing if row % 10 < 3 else staying)
+        fields = ",?" * len(camera)
+        db.execute(f"INSERT INTO camera VALUES (?{fields})", (row, *camera))
+    db.execute("UPDATE camera SET motion_area = zeroblob(345)")
+    db.commit()
+    db.close()
 
 
 def fresh_database():
@@ -91,81 +95,84 @@ def fresh_database():
 
 
 def make_files(count, text, directory=FILES):
-    """Makes so many capability files of some 40 lines, with the text in the middle of each."""
+    """Makes capability files of some 40 lines, with the text in the middle."""
     shutil.rmtree(directory, ignore_errors=True)
     directory.mkdir()
-    lines = "".join(f"resolution_{line} = 1920x1080,1280x720\n" for line in range(18))
+    lines = [f"resolution_{line} = 1920x1080,1280x720\n" for line in range(18)]
     for number in range(count):
-        (directory / f"{number:05}").write_text(lines + text + lines)
+        file = directory / f"{number:05}"
+        file.write_text("".join([*lines, text, *lines]))
 
 
 def make_settings():
-    """Makes what the library's calls read and change, also with the group that GKeyFile needs."""
-    lines = "".join(f"camera{line}=the setting of {line}\n" for line in range(1000, 2000))
-    Path("/var/settings").write_text(lines)
-    Path("/var/settings.ini").write_text("[settings]\n" + lines)
+    """Makes what the library and GKeyFile, which needs a group, change."""
+    lines = [f"camera{n}=the setting of {n}\n" for n in range(1000, 2000)]
+    Path("/var/settings").write_text("".join(lines))
+    Path("/var/settings.ini").write_text("[settings]\n" + "".join(lines))
 
 
 def upgrade(count, rounds):
     actions = (ROOT / "tests/expected/actions.txt").read_text()
-    texts = re.findall(r"^\* (.*(?:\n  .*)*)", actions, re.MULTILINE)
-    # Without the cameras that make_cameras() leaves out: they have transactions of their own.
-    changes = [f"BEGIN;{text};COMMIT;" for text in texts if not re.match("INSERT|.* id=", text)]
-    commands = {
-        "ours": [TOOL, "0"],
+    # Without the cameras that make_cameras() leaves out.
+    texts = re.findall(r"(?m)^\* (?!INSERT|.* id=)(.*(?:\n  .*)*)", actions)
+    changes = [f"BEGIN;{text};COMMIT;" for text in texts]
+    script = [f'sqlite3 {DATABASE} "{change}"' for change in changes]
+    ways = {
+        "ours": UPGRADE,
         "one sqlite3": ["sqlite3", DATABASE, *changes],
-        "script": ["sh", "-ec", "\n".join(f'sqlite3 {DATABASE} "{text}"' for text in changes)],
+        "script": ["sh", "-ec", "\n".join(script)],
     }
     make_cameras(count)
-    found = interleave(commands, rounds, fresh_database)
-    for name, command in commands.items():
+    found = interleave(ways, rounds, fresh_database)
+    for way, command in ways.items():
         fresh_database()
-        found[name]["syncs"] = system_calls(command, "fsync,fdatasync").total()
+        found[way]["syncs"] = system_calls(command, "fsync,fdatasync").total()
     return found
 
 
 def library_calls():
     make_settings()
-    options = "enable_random_interleaving=true repetitions=9 min_time=0.1 format=json"
-    command = [CALLS, *(f"--benchmark_{option}" for option in options.split())]
-    found = collections.defaultdict(dict)
-    for timed in json.loads(subprocess.check_output(command))["benchmarks"]:
-        if timed.get("aggregate_name") == "median":
-            call, way = timed["run_name"].split("/")
-            found[call][way] = {"wall": timed["real_time"] / 1e9}
+    options = "enable_random_interleaving=true repetitions=9 min_time=0.1"
+    options = [f"--benchmark_{option}" for option in options.split()]
+    timed = [CALLS, "--benchmark_format=json", *options]
+    found = defaultdict(dict)
+    for row in json.loads(subprocess.check_output(timed))["benchmarks"]:
+        if row.get("aggregate_name") == "median":
+            call, way = row["run_name"].split("/")
+            found[call][way] = {"wall": row["real_time"] / 1e9}
     return found
 
 
 def measure():
-    """Returns the figures of each workload, by the ways in which it is done."""
+    """Returns the figures of each workload, by the ways to do it."""
     found = {}
-    for count, rounds in SIZES.items():
-        found[f"upgrade of {count} cameras"] = upgrade(count, rounds)
-    preview = [BUILD / "preview/tessel-preview", "--tool", TOOL, DATABASE, "0"]
-    ways = {"ours": preview, "upgrade": [TOOL, "0"]}
-    found[f"preview of {count} cameras"] = interleave(ways, rounds, fresh_database)
-    ours = [TOOL, "--updateCap", FILES]
+    for cameras, rounds in SIZES.items():
+        found[f"upgrade of {cameras} cameras"] = upgrade(cameras, rounds)
+    ways = {"ours": PREVIEW, "upgrade": UPGRADE}
+    previews = interleave(ways, rounds, fresh_database)
+    found[f"preview of {cameras} cameras"] = previews
     make_files(10000, "pan= continuous\nptz_speed_max = 1\n")
-    ways = {"ours": ours, "grep -c": ["grep", "-c", "=", "-r", FILES]}
+    ways = {"ours": UPDATE_FILES, "grep -c": GREP}
     found["10000 unchanged capability files"] = interleave(ways, 9)
-    sed = rf"sed -i -E 's/^(pan|tilt) = yes/\1= step/' {FILES}/*"
-    ways = {"ours": ours, "sed -i": ["sh", "-c", sed]}
+    ways = {"ours": UPDATE_FILES, "sed -i": SED}
     text = "pan = yes\ntilt = yes\n"
-    found["2000 changed capability files"] = interleave(ways, 9, lambda: make_files(2000, text))
-    return {**found, **library_calls()}
+    changed = interleave(ways, 9, lambda: make_files(2000, text))
+    found["2000 changed capability files"] = changed
+    return found | library_calls()
 
 
 def count(workload):
     """Returns the system calls and instructions of doing it once more."""
-    # An upgrade from the lower version runs one action more.
-    arguments = {"one database action": "83 82", "one capability-file action": "80 79"}
-    program = [TOOL] if workload in arguments else [CALLS, f"{workload}/ours"]
-    counted = []
-    for argument in arguments.get(workload, "1 2").split():
-        for tool in system_calls, instructions:
-            make_cameras(3)  # TVIP62000, the example's first, which the counted action changes
-            fresh_database()
-            make_files(9, "pan= continuous\ntilt = no\n", TARGET / "@camveld/@KICapInfo")
-            make_settings()
-            counted.append(tool([*program, argument]))
-    return counted[2] - counted[0], counted[3] - counted[1]
+    program, less, more = [CALLS, f"{workload}/ours"], 1, 2
+    if workload in ACTIONS:
+        program, less, more = [TOOL], ACTIONS[workload], ACTIONS[workload] - 1
+
+    def counted(counter, argument):
+        make_cameras(3)  # TVIP62000, the first, which the action changes
+        fresh_database()
+        make_files(9, "pan= continuous\ntilt = no\n", CAPS)
+        make_settings()
+        return counter([*program, str(argument)])
+
+    for counter in system_calls, instructions:
+        yield counted(counter, more) - counted(counter, less)
