@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <pthread.h>
+#include <sys/shm.h>
 
 #include <csignal>
 #include <memory>
@@ -149,6 +150,15 @@ TEST_F(Log, EachCategoryHasANameOfItsOwn) {
   for (int Value = 0; Value < LOG_CATEG_TOTAL; ++Value) {
     EXPECT_TRUE(Names.insert(Enum2String(Categ(Value))).second) << Value;
   }
+}
+
+TEST_F(Log, ConfigurationOfAnotherUserIsNotUsed) {
+  const int Id = shmget(KiShmDbgLogIPCKey(), sizeof(m_Cfg), IPC_CREAT | 0600);
+  if (seteuid(1) == 0) {  // an ordinary user's namespace knows no second user
+    EXPECT_EQ(KiShmDbgLogCfgAt(), nullptr);
+    ASSERT_EQ(seteuid(0), 0);
+  }
+  shmctl(Id, IPC_RMID, nullptr);
 }
 
 TEST_F(Log, ConfigurationKeepsItsLayoutAndItsBounds) {
