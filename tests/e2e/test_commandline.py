@@ -12,7 +12,10 @@ USAGE = (
 )
 
 
-@pytest.mark.parametrize("arguments", ["", "1 2", "1 2 3", "--updatecap /tmp"])
+OTHERS = ["", "1 2", "1 2 3", "--updatecap /tmp", "--updateCap / 3"]
+
+
+@pytest.mark.parametrize("arguments", OTHERS)
 def test_other_arguments_only_print_the_usage(example, arguments):
     result = example.upgrade(*arguments.split())
     assert result.status == 1
@@ -48,6 +51,9 @@ MISSING = [
 
 @pytest.mark.parametrize("missing, arguments, status", MISSING)
 def test_without_the_packages_directory(example, missing, arguments, status):
-    shutil.rmtree(example.directory / missing)
-    ended = run(*example.command(TOOL, *arguments))
-    assert (ended.returncode, ended.stdout) == (status, "")
+    directory = example.directory / missing
+    command = example.command(TOOL, *arguments)
+    shutil.rmtree(directory)
+    assert run(*command).returncode == status
+    directory.touch()
+    assert run(*command).returncode == status
