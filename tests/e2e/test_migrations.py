@@ -12,6 +12,7 @@ from conftest import PREVIEW, SOURCE, STRACE, new_appliance, run
 
 EXPECTED = SOURCE / "tests/expected"
 TABLE_ROW = re.compile(r"^ *\{(\d+), (?!nullptr)(\w+)\},$", re.M)
+FAST = "--trace=openat --seccomp-bpf -f".split()
 FAILURE = re.compile(
     r"cpp:(\w+)\(\): KiDBExecute command \((.*?)\) error\.$", re.S | re.M
 )
@@ -62,9 +63,9 @@ def transactions(request):
         # action. Here, it cannot open the database for the text.
         for number in range(1, 1000):
             example.database.write_bytes(start)
-            inject = f"inject=openat:error=EIO:when={number}"
-            which = ["-P", example.database, "-e", inject]
-            result = example.upgrade(0, under=[*STRACE, *which])
+            inject = f"--inject=openat:error=EIO:when={number}"
+            under = [*STRACE, *FAST, "-P", example.database, inject]
+            result = example.upgrade(0, under=under)
             failed = failures(result)
             if not failed:
                 break
