@@ -185,17 +185,18 @@ def unified_diffs(before, after):
 
 @contextmanager
 def new_appliance(config):
-    assert (
-        "TESSEL_PRIVATE_VAR" in os.environ
-    ), "start it with tools/private-var"
+    """Makes /var an appliance of its own until the block ends."""
+    assert "TESSEL_PRIVATE_VAR" in os.environ, "needs tools/private-var"
     subprocess.check_call(["mount", "-t", "tmpfs", "tmpfs", "/var"])
     appliance = Appliance(SOURCE / config.getoption("build"))
     for path in appliance.caps, appliance.log_file.parent:
         path.mkdir(parents=True)
     Path("/var/services/camveld").mkdir(parents=True)
-    yield appliance
-    subprocess.check_call(["umount", "--lazy", "/var"])
-    subprocess.check_call(["ipcrm", "--all=shm"])
+    try:
+        yield appliance
+    finally:
+        subprocess.check_call(["umount", "--lazy", "/var"])
+        subprocess.check_call(["ipcrm", "--all=shm"])
 
 
 @pytest.fixture

@@ -48,10 +48,7 @@ STATUSES = [
     # program, arguments that lead to each status of its man page
     (TOOL, ["99999", "", "0"]),
     (KIDBGLOG, ["--help", "show", "--nonsense"]),
-    (
-        PREVIEW,
-        ["--help", "--nonsense", "--tool {} --check {} 0", "--tool {} {} 0"],
-    ),
+    (PREVIEW, ["--help", "-x", "--tool {} --check {} 0", "--tool {} {} 0"]),
 ]
 
 

@@ -66,10 +66,8 @@ MESSAGES = [
     (100, "show", "1 the segment has 100 bytes, not 2568"),
     (2568, "load", "1 nothing loaded from /var/packages/Camveld/etc/"),
     (2568, "pid 4194305 info", "1 there is no process 4194305"),
-    (2568, "pid 1 clear", "1 process 1 has no threshold of its own"),
     (0, "set rtps debug", "2 no category 'rtps', the nearest is 'rtp'"),
     (0, "set utils warning", "2 no level 'warning', the nearest is 'warn'"),
-    (0, "set utils", "2 wrong arguments for 'set', see 'kidbglog --help'"),
 ]
 
 

@@ -39,7 +39,6 @@ def test_two_runs_beside_the_recorder_are_like_one_after_the_other(
     with Popen([*recorder, *[count] * 300]):
         ended = run(*both)
     assert ended.returncode == 0, ended.stdout
-    counted = example.sql("SELECT DISTINCT update_time FROM camera")
-    assert counted == [(300,)]
+    assert example.sql("SELECT DISTINCT update_time FROM camera") == [(300,)]
     example.sql("UPDATE camera SET update_time = NULL")
     assert left_behind(example) == expected
