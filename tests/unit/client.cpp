@@ -29,7 +29,7 @@ static void WriteLines() {
 int main(int /*argc*/, char** argv) {
   const std::string strCommand = argv[1];
   PrintAttached();
-  alarm(120);  // a failed test may leave the process behind
+  alarm(30);  // a failed test may leave the process behind
   while (strCommand == "loop") {
     const auto Categ = static_cast<LOG_CATEG>(std::stoi(argv[2]));
     const auto Level = static_cast<LOG_LEVEL>(std::stoi(argv[3]));
