@@ -10,6 +10,7 @@
 #include <cstdlib>
 #include <memory>
 #include <string_view>
+#include <utility>
 
 #include "fileops.h"
 #include "kidebuglog.h"
@@ -115,17 +116,22 @@ class CancelDisabler {
   CancelDisabler& operator=(const CancelDisabler&) = delete;
 };
 
-// Returns 0, or -1 with the errno of the step that failed.
-int WriteText(const char* szFile, const std::string& strText) {
-  fileops::Descriptor Fd(open(szFile, O_WRONLY | O_TRUNC | O_CLOEXEC));
-  if (Fd.Get() == -1 || fileops::WriteAll(Fd.Get(), strText.data(), strText.size()) != 0) {
-    return -1;
+// Creates "szTemplate.tmp.XXXXXX" (mode 0600) with a unique name. Returns its descriptor, which the
+// caller owns, and its name in strName; or -1 and an empty name after logging the reason.
+int CreateTmpFile(const char* szTemplate, std::string& strName) {
+  strName.assign(szTemplate).append(".tmp.XXXXXX");
+  const int Fd = mkostemp(strName.data(), O_CLOEXEC);
+  if (Fd == -1) {
+    KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to create tmp file with errno [%d]\n",
+             errno);
+    strName.clear();
   }
-  return Fd.Close();
+  return Fd;
 }
 
-int WriteToFile(const char* szFile, const KeyValMap& KeyVals, bool blQuoteVal) {
-  if (szFile == nullptr || *szFile == '\0') {
+// Writes the pairs to Fd, which is open at the empty file szFile.
+int WriteToFile(int Fd, const char* szFile, const KeyValMap& KeyVals, bool blQuoteVal) {
+  if (*szFile == '\0') {
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "File not specified.\n");
     return -1;
   }
@@ -134,7 +140,7 @@ int WriteToFile(const char* szFile, const KeyValMap& KeyVals, bool blQuoteVal) {
   for (const auto& [strKey, strVal] : KeyVals) {
     strText.append(strKey).append("=").append(szQuote).append(strVal).append(szQuote).append("\n");
   }
-  if (WriteText(szFile, strText) != 0) {
+  if (fileops::WriteAll(Fd, strText.data(), strText.size()) != 0) {
     // keep "wrtie": others search for this text
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to wrtie file [%s] with errno [%d].\n",
              szFile, errno);
@@ -143,9 +149,13 @@ int WriteToFile(const char* szFile, const KeyValMap& KeyVals, bool blQuoteVal) {
   return 0;
 }
 
+// Uses the temporary file by the descriptor that created it: whoever may write the directory can
+// put a link to another file in its place, which an open or a chown by name would follow.
 int WriteToFileAtomic(const char* szFile, const KeyValMap& KeyVals, bool blQuoteVal) {
-  fileops::TmpFile Tmp(CreateTmpFile(szFile));
-  if (WriteToFile(Tmp.Name(), KeyVals, blQuoteVal) != 0) {
+  std::string strTmp;
+  fileops::Descriptor Fd(CreateTmpFile(szFile, strTmp));
+  fileops::TmpFile Tmp(std::move(strTmp));
+  if (WriteToFile(Fd.Get(), Tmp.Name(), KeyVals, blQuoteVal) != 0) {
     return -1;
   }
   struct stat Stat;
@@ -154,14 +164,20 @@ int WriteToFileAtomic(const char* szFile, const KeyValMap& KeyVals, bool blQuote
              errno);
     return -1;
   }
-  if (chown(Tmp.Name(), Stat.st_uid, Stat.st_gid) != 0) {
+  if (fchown(Fd.Get(), Stat.st_uid, Stat.st_gid) != 0) {
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to chown [%s] with errno [%d]\n", Tmp.Name(),
              errno);
     return -1;
   }
-  if (chmod(Tmp.Name(), Stat.st_mode & 07777) != 0) {
+  if (fchmod(Fd.Get(), Stat.st_mode & 07777) != 0) {
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to chmod [%s] with errno [%d]\n", Tmp.Name(),
              errno);
+    return -1;
+  }
+  if (Fd.Close() != 0) {
+    // Some file systems report only now that they could not store what was written.
+    KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to wrtie file [%s] with errno [%d].\n",
+             Tmp.Name(), errno);
     return -1;
   }
   if (Tmp.RenameTo(szFile) != 0) {
@@ -253,12 +269,7 @@ int KiFileRemoveKeys(const char* szFile, const std::set<std::string>& Keys) {
 }
 
 std::string CreateTmpFile(const char* szTemplate) {
-  std::string strName = std::string(szTemplate) + ".tmp.XXXXXX";
-  const fileops::Descriptor Fd(mkostemp(strName.data(), O_CLOEXEC));
-  if (Fd.Get() == -1) {
-    KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to create tmp file with errno [%d]\n",
-             errno);
-    return "";
-  }
+  std::string strName;
+  const fileops::Descriptor Fd(CreateTmpFile(szTemplate, strName));
   return strName;
 }

@@ -35,7 +35,8 @@ int KiFileGetVal(const char* szFile, const char* szKey, std::string& strVal);
 //
 // The new content is written to "szFile.tmp.XXXXXX" in the same directory. That file gets the
 // owner, group and mode of szFile and then replaces it. A reader sees all of a change or nothing,
-// and no change of another caller is lost. A symbolic link is itself replaced.
+// and no change of another caller is lost. A symbolic link is itself replaced. A
+// link that somebody puts in the place of the new content's file is not followed.
 //
 // The change is not synced to stable storage. After a power cut, the file may be the old one or the
 // new one, empty, a part of the new one, or the new one with the mode and owner of the temporary

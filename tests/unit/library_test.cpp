@@ -4,6 +4,7 @@
 #include <pthread.h>
 #include <sys/shm.h>
 
+#include <atomic>
 #include <csignal>
 #include <memory>
 #include <set>
@@ -86,6 +87,35 @@ TEST_F(KeyVal, ChangeIsOfTheFileThatIsThereWhenItsTurnComes) {
   New.UnLock();
   Change.join();
   EXPECT_EQ(ReadFile(NAME), "a=2\n");
+}
+
+TEST_F(KeyVal, ChangeFollowsNoLinkInPlaceOfItsTemporaryFile) {
+  const char* const szVictim = "/var/victim";
+  WriteFile(szVictim, "victim\n");
+  chmod(szVictim, 0600);
+  const auto Before = Rights(szVictim);
+  WriteFile(NAME, "");
+  static_cast<void>(!chown(NAME, 12, 34));
+  std::atomic<bool> blStop = false;
+  std::thread Attacker([&blStop, szVictim] {
+    std::error_code Error;  // another thread removes what the directory lists
+    while (!blStop) {
+      for (const auto& Entry : fs::directory_iterator("/var/services/camveld", Error)) {
+        if (Entry.path() != NAME && fs::remove(Entry, Error)) {
+          fs::create_symlink(szVictim, Entry, Error);
+        }
+      }
+    }
+  });
+  for (int Change = 0; Change < 3000; ++Change) {
+    KiFileSetVal(NAME, "a", "1", false);
+  }
+  blStop = true;
+  Attacker.join();
+  EXPECT_EQ(KiFileSetVal(NAME, "a", "2", false), 0);
+  EXPECT_EQ(ReadFile(NAME), "a=2\n");
+  EXPECT_EQ(ReadFile(szVictim), "victim\n");
+  EXPECT_EQ(Rights(szVictim), Before);
 }
 
 TEST_F(KeyVal, CancelledThreadFinishesWhatItBegan) {
