@@ -21,9 +21,11 @@ class KiEnum2StrMap {
 };
 
 // The name of Enum, or "unknown". The text lives as long as the process; the caller must not free
-// it. Any thread may call it until the process destroys its static objects at exit.
+// it. Any thread may call it at any time, even while the process exits.
 template <typename T>
 const char* Enum2String(T Enum) {
-  static const KiEnum2StrMap<T> Map;
-  return Map[Enum];
+  // Never destroyed: the destructors of global objects may log. Not called Map: programs built with
+  // version 1.0.0 have an object of that name, and the shared library would use it as a pointer.
+  static const KiEnum2StrMap<T>* const pMap = new KiEnum2StrMap<T>;
+  return (*pMap)[Enum];
 }

@@ -15,6 +15,7 @@ def test_configuration_is_attached_from_start_to_end(appliance):
     client = appliance.command(CLIENT, "get", file, "key")
     # Before main, in it, after it, and at the very end of each process.
     assert run(*client).stdout == "0000"
+    assert appliance.log() == ["[event][alarm] client.cpp:End(): End"] * 2
     run(*appliance.command(KIDBGLOG, "create"))
     assert run(*client).stdout == "0110"
 

@@ -1,5 +1,6 @@
 // A program of the package. Prints whether the shared configuration is attached while its global
-// object is constructed, in main, while the object is destroyed, and at the very end.
+// object is constructed, in main, while the object is destroyed, and at the very end. Logs at the
+// last two.
 
 #include <fileutils.h>
 #include <kidebuglog.h>
@@ -11,12 +12,17 @@
 
 static void PrintAttached() { printf("%d", g_pDbgLogCfg != nullptr); }
 
+static void End() {
+  PrintAttached();
+  KIDBGLOG(LOG_CATEG_EVENT, LOG_LEVEL_ALARM, "End\n");
+}
+
 static struct Global {
   Global() { PrintAttached(); }
-  ~Global() { PrintAttached(); }
+  ~Global() { End(); }
 } gGlobal;
 
-__attribute__((destructor(101))) static void AtTheVeryEnd() { PrintAttached(); }
+__attribute__((destructor(101))) static void AtTheVeryEnd() { End(); }
 
 // Lines of a number and some zeros, until the process is killed.
 static void WriteLines() {
