@@ -49,6 +49,7 @@ int CreateAnew(const char* szName) {
   const auto Create = [szName] {
     return open(szName, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600);
   };
+  const NoCancel Guard;
   const int Fd = Create();
   if (Fd == -1 && errno == EEXIST && unlink(szName) == 0) {
     return Create();

@@ -23,9 +23,12 @@ class ErrnoKeeper {
 };
 
 // Disables cancellation of the calling thread when constructed and restores the previous state when
-// destroyed. Every destructor that calls a cancellation point (close, fclose, ...) needs one,
-// because cancellation throws, and throwing in a destructor ends the whole process. A request that
-// arrives meanwhile waits for the thread's next cancellation point.
+// destroyed. A request that arrives meanwhile waits for the thread's next cancellation point.
+//
+// Every destructor that calls a cancellation point (close, fclose, ...) needs one, because
+// cancellation throws, and throwing in a destructor ends the whole process. Every call that opens a
+// descriptor (open, fopen, ...) needs one, because a thread that is cancelled in it may lose the
+// descriptor.
 class NoCancel {
  public:
   NoCancel();
@@ -81,7 +84,7 @@ class TmpFile {
 // Creates the file szName (mode 0600) and opens it for writing. First removes an existing file of
 // that name. The caller must hold a lock that keeps others from creating it, so that only a killed
 // process can have left such a file. Returns the descriptor, which the caller owns, or -1 with
-// errno.
+// errno. Not a cancellation point.
 int CreateAnew(const char* szName);
 
 // Writes all Len bytes at pBuf to Fd, in as many calls as needed. Continues after a signal (EINTR).

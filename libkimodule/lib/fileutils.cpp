@@ -29,6 +29,11 @@ struct FileCloser {
 };
 using File = std::unique_ptr<FILE, FileCloser>;
 
+File Open(const char* szFile) {
+  const fileops::NoCancel Guard;
+  return File(fopen(szFile, "re"));
+}
+
 struct LineBuffer {
   ~LineBuffer() { free(szLine); }
   char* szLine = nullptr;
@@ -56,7 +61,7 @@ int ParseKeyVal(std::string_view Line, std::string_view& Key, std::string_view& 
 // null, only its keys count. Returns 0, or the errno of the failed open or read.
 int ReadKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals, int& Match) {
   char rgBuf[4096];  // must outlive the stream; saves it asking the system for a size
-  const File pFile(fopen(szFile, "re"));
+  const File pFile = Open(szFile);
   if (pFile == nullptr) {
     return errno;
   }
@@ -120,6 +125,7 @@ class CancelDisabler {
 // caller owns, and its name in strName; or -1 and an empty name after logging the reason.
 int CreateTmpFile(const char* szTemplate, std::string& strName) {
   strName.assign(szTemplate).append(".tmp.XXXXXX");
+  const fileops::NoCancel Guard;
   const int Fd = mkostemp(strName.data(), O_CLOEXEC);
   if (Fd == -1) {
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to create tmp file with errno [%d]\n",

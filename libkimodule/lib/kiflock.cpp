@@ -69,6 +69,7 @@ int KiFlock::UnLock(int Fd) { return flock(Fd, LOCK_UN); }
 
 int KiFlock::Flock(int TimeoutSec, bool blExclusive) {
   if (m_Fd == -1) {
+    const fileops::NoCancel Guard;
     m_Fd = open(m_strName.c_str(), O_RDONLY | O_CREAT | O_CLOEXEC, 0644);
     if (m_Fd == -1) {
       return -1;
