@@ -2,23 +2,12 @@
 
 #include <sched.h>
 
-#include <cerrno>
-#include <ctime>
-
+#include "sleep.h"
 #include "utils.h"
 
 namespace {
 
 constexpr int64_t USEC_PER_SEC = 1000000;
-
-// Sleeps the whole time, even if signals arrive.
-void Sleep(int64_t usec) {
-  timespec Left = {};
-  Left.tv_sec = USecToSec(usec);
-  Left.tv_nsec = static_cast<long>(usec % USEC_PER_SEC * 1000);
-  while (nanosleep(&Left, &Left) != 0 && errno == EINTR) {
-  }
-}
 
 }  // namespace
 
@@ -43,5 +32,5 @@ void DelayTimer::Delay() {
   const int64_t usecNext = int64_t{m_tvLast.tv_usec} + m_usecDelay;
   m_tvLast.tv_sec += USecToSec(usecNext);
   m_tvLast.tv_usec = static_cast<decltype(m_tvLast.tv_usec)>(usecNext % USEC_PER_SEC);
-  Sleep(m_usecDelay - usecPassed);
+  SleepWhole(m_usecDelay - usecPassed);
 }

@@ -95,10 +95,20 @@ int ReadKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals, int
   return feof(pFile.get()) != 0 ? 0 : Errno;
 }
 
+// Waits for the lock without a time limit. A signal handler without SA_RESTART ends the wait of
+// KiFlock.
+int LockAfterSignals(KiFlock& Lock, bool blExclusive) {
+  int Ret = -1;
+  do {
+    Ret = blExclusive ? Lock.LockEx(-1) : Lock.LockSh(-1);
+  } while (Ret != 0 && errno == EINTR);
+  return Ret;
+}
+
 // Adds the pairs of szFile to KeyVals under a shared lock. Returns the number of lines, or -1.
 int GetKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals) {
   KiFlock Lock(szFile);
-  if (Lock.LockSh(-1) != 0) {
+  if (LockAfterSignals(Lock, false) != 0) {
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to lock file [%s] with errno [%d]\n", szFile,
              errno);
     return -1;
@@ -196,7 +206,7 @@ int WriteToFileAtomic(const char* szFile, const KeyValMap& KeyVals, bool blQuote
 
 // Locks again if the previous holder of the lock has replaced the file.
 int LockCurrent(KiFlock& Lock) {
-  while (Lock.LockEx(-1) == 0) {
+  while (LockAfterSignals(Lock, true) == 0) {
     if (Lock.IsCurrent()) {
       return 0;
     }

@@ -6,8 +6,9 @@
 // comments. A line without '=' has no meaning. If several lines have the same key, the first line
 // counts. Keys and values may contain any bytes except line feeds, which end a line.
 //
-// A call locks the file (see kiflock.h) and waits for the lock without a time limit. Any thread of
-// any process may call. The reason for a failure is logged under LOG_CATEG_UTILS, LOG_LEVEL_ERROR.
+// A call locks the file (see kiflock.h) and waits for the lock without a time limit, whatever
+// signals arrive. Any thread of any process may call. The reason for a failure is logged under
+// LOG_CATEG_UTILS, LOG_LEVEL_ERROR.
 #pragma once
 
 #include <map>

@@ -10,11 +10,12 @@
 #include <utility>
 
 #include "fileops.h"
+#include "sleep.h"
 
 namespace {
 
 constexpr int ATTEMPTS_PER_SEC = 10;
-constexpr useconds_t ATTEMPT_DELAY_USEC = 1000000 / ATTEMPTS_PER_SEC;
+constexpr int64_t ATTEMPT_DELAY_USEC = 1000000 / ATTEMPTS_PER_SEC;
 
 }  // namespace
 
@@ -59,7 +60,7 @@ int KiFlock::Lock(int Fd, int TimeoutSec, bool blExclusive) {
       return 0;
     }
     Errno = errno;
-    usleep(ATTEMPT_DELAY_USEC);
+    SleepWhole(ATTEMPT_DELAY_USEC);
   }
   errno = Errno;
   return Ret;

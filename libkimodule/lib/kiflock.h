@@ -30,8 +30,9 @@ class KiFlock {
   // cancellation point.
   void UnLock();
 
-  // Locks the open descriptor Fd. A TimeoutSec below 0 waits forever, 0 tries once, and a positive
-  // number tries ten times a second for that many seconds. Returns 0, or -1 with flock's errno.
+  // Locks the open descriptor Fd. A TimeoutSec below 0 waits until the lock is free or a signal
+  // handler without SA_RESTART runs (EINTR), 0 tries once, and a positive number tries ten times a
+  // second for that many seconds, whatever signals arrive. Returns 0, or -1 with flock's errno.
   static int Lock(int Fd, int TimeoutSec, bool blExclusive);
 
   // Unlocks the descriptor Fd. Returns 0, or -1 with flock's errno.

@@ -38,6 +38,13 @@ class Log : public PrivateVar {
 LOG_CATEG Categ(int Value) { return static_cast<LOG_CATEG>(Value); }
 LOG_LEVEL Level(int Value) { return static_cast<LOG_LEVEL>(Value); }
 
+// Lets SIGALRM interrupt system calls.
+void Interrupt() {
+  struct sigaction Action = {};  // without SA_RESTART
+  Action.sa_handler = [](int) {};
+  sigaction(SIGALRM, &Action, nullptr);
+}
+
 KeyValMap Read(const std::string& strText) {
   KeyValMap KeyVals = {{"old", "old"}};
   WriteFile(NAME, strText);
@@ -76,12 +83,19 @@ TEST_F(KeyVal, ChangeIsOfTheFileThatIsThereWhenItsTurnComes) {
   const char* const szNew = "/var/services/camveld/new";
   KiFlock Old(NAME);
   KiFlock New(szNew);
-  EXPECT_EQ(Old.LockSh(0) + New.LockSh(0), 0);
+  EXPECT_EQ(Old.LockEx(0) + New.LockSh(0), 0);
   WriteFile(szNew, "a=1\n");
+  std::string strVal;
+  std::thread Reader([&strVal] { KiFileGetVal(NAME, "a", strVal); });
   std::thread Change([] { KiFileSetVal(NAME, "a", "2", false); });
+  Interrupt();
   usleep(100000);
+  pthread_kill(Reader.native_handle(), SIGALRM);
+  pthread_kill(Change.native_handle(), SIGALRM);
   fs::rename(szNew, NAME);
   Old.UnLock();
+  Reader.join();
+  EXPECT_EQ(strVal, "1");
   usleep(100000);
   EXPECT_EQ(ReadFile(NAME), "a=1\n");
   New.UnLock();
@@ -168,9 +182,12 @@ TEST_F(KeyVal, LockExcludesOthersAsLongAsItIsTold) {
   EXPECT_EQ(Held.LockEx(0), -1);
   Other.UnLock();
   EXPECT_EQ(Held.LockEx(0), 0);  // converts the lock it has
+  Interrupt();
   const int64_t usecStart = GetCurTimestamp();
+  ualarm(10000, 10000);
   EXPECT_EQ(Other.LockSh(1), -1);
   EXPECT_EQ(errno, EWOULDBLOCK);
+  ualarm(0, 0);
   EXPECT_NEAR(static_cast<double>(GetCurTimestamp() - usecStart), 2e6, 1.1e6);
 }
 
@@ -289,9 +306,7 @@ TEST(Utils, WritingGoesOnAfterSignalsAndFullPipes) {
   const std::string strText = ReadFile("/proc/self/exe").substr(0, 1 << 18);
   const auto Len = static_cast<int32_t>(strText.size());
   ASSERT_EQ(Len, 1 << 18);
-  struct sigaction Interrupt = {};  // without SA_RESTART
-  Interrupt.sa_handler = [](int) {};
-  sigaction(SIGALRM, &Interrupt, nullptr);
+  Interrupt();
   for (const auto& [Flags, pWrite] :
        {std::pair(0, &WriteFd), std::pair(O_NONBLOCK, &WriteFd), std::pair(0, &WriteAll)}) {
     int rgFd[2];
