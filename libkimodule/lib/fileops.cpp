@@ -28,7 +28,7 @@ int Descriptor::Close() {
   return close(std::exchange(m_Fd, -1));
 }
 
-TmpFile::TmpFile(std::string strName) : m_strName(std::move(strName)) {}
+TmpFile::TmpFile(std::string strName) noexcept : m_strName(std::move(strName)) {}
 
 TmpFile::~TmpFile() {
   const ErrnoKeeper Errno;

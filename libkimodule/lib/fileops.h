@@ -64,8 +64,9 @@ class Descriptor {
 // the file its final name. Does not own the file's descriptor.
 class TmpFile {
  public:
-  // Adopts the file strName, which the caller has created. An empty name means no file.
-  explicit TmpFile(std::string strName);
+  // Adopts the file strName, which the caller has created. An empty name means no file. Move the
+  // name in: memory may run out for a copy, and nobody would remove the file then.
+  explicit TmpFile(std::string strName) noexcept;
   ~TmpFile();
   TmpFile(const TmpFile&) = delete;
   TmpFile& operator=(const TmpFile&) = delete;
