@@ -207,6 +207,13 @@ void KiDbgPrintf(LOG_CATEG Categ, LOG_LEVEL Level, const char* szFile, int LineN
 
 namespace {
 
+// Programs that were linked to the first packages of version 1.0.0 call these members in the shared
+// library. The pointers make the compiler emit them, although the header defines them inline.
+[[gnu::used]] constexpr LOG_LEVEL (KiDbgLogCfg::*GET_LOG_LEVEL)(LOG_CATEG) const =
+    &KiDbgLogCfg::GetLogLevel;
+[[gnu::used]] constexpr LOG_LEVEL (KiDbgLogCfg::*GET_PID_LEVEL)(pid_t) const =
+    &KiDbgLogCfg::GetPidLevel;
+
 constexpr const char* SETTINGS_FILE = "/var/packages/Camveld/etc/settings.conf";
 constexpr const char* LEVELS_KEY = "ki_dbglog_settings";  // by category, separated by commas
 constexpr const char* IN_MS_KEY = "ki_dbglog_time_scale";

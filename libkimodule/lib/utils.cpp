@@ -224,6 +224,11 @@ int32_t WriteFd(int Fd, const void* pBuf, int32_t BufLen) {
   return Written;
 }
 
+// Programs that were linked to version 1.0.0 call this form. No header declares it.
+int32_t WriteFd(int Fd, const char* pBuf, int32_t BufLen) {
+  return WriteFd(Fd, static_cast<const void*>(pBuf), BufLen);
+}
+
 bool CreateThread(ThreadFunc FuncPtr, void* FuncParam, uint32_t StackSize, bool blSetDetach,
                   pthread_t& ThreadId) {
   pthread_attr_t Attr;
