@@ -233,6 +233,8 @@ void KiDbgLogCfg::Init(int /*ShmKey*/) {
   LoadDbgLogSettings();
 }
 
+void KiDbgLogCfg::Free() {}
+
 int KiDbgLogCfg::LoadDbgLogSettings() {
   std::map<std::string, std::string> KeyVals;
   const int Ret = KiFileGetKeyVals(SETTINGS_FILE, {LEVELS_KEY, IN_MS_KEY}, KeyVals);

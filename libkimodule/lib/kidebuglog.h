@@ -86,6 +86,9 @@ class KiDbgLogCfg {
   // empty process table), then loads the saved settings. Ignores ShmKey, the segment's key.
   void Init(int ShmKey);
 
+  // Does nothing: the object owns nothing. Whoever created the segment removes it.
+  void Free();
+
   // Load the thresholds of the categories and the switch for milliseconds from the package's
   // settings file, /var/packages/Camveld/etc/settings.conf, or save them there. Loading leaves a
   // setting unchanged if it is not in the file, and ignores numbers after the first LOG_CATEG_MAX.
