@@ -110,73 +110,109 @@ int OpenLog(LOG_TYPE LogType) {
   return Fd;
 }
 
-constexpr char PREFIX_FORMAT[] = "%s %s%s %s:%d:%s(): ";
-
-struct LinePrefix {
-  char szTime[FIELD_SIZE] = "";
-  char szPidTid[FIELD_SIZE];
-  char szCategLevel[FIELD_SIZE] = "";
+// Where a message comes from, as the caller of the log gives it.
+struct Origin {
+  const char* szCateg;
+  const char* szLevel;
+  const char* szFile;
+  int LineNo;
+  const char* szFunc;
 };
 
+// The fields before the message of a line. The texts belong to the caller of the log.
+struct LinePrefix {
+  char szTime[FIELD_SIZE] = "";
+  char szPidTid[FIELD_SIZE] = "";
+  char szCategLevel[FIELD_SIZE] = "";
+  const char* szFile = "";
+  int LineNo = 0;
+  const char* szFunc = "";
+};
+
+constexpr char PREFIX_FORMAT[] = "%s %s%s %s:%d:%s(): ";
+
 // Call with the lock held: the lines of a file must be in the order of their times.
-void FillPrefix(LinePrefix* pPrefix, const char* szCateg, const char* szLevel) {
+LinePrefix MakePrefix(const Origin& From) {
+  LinePrefix Prefix;
   const pid_t Pid = getpid();
   const pid_t Tid = gettid();
-  KiGetPresentTime(pPrefix->szTime);
+  KiGetPresentTime(Prefix.szTime);
   if (Pid == Tid) {
-    snprintf(pPrefix->szPidTid, FIELD_SIZE, "[%d]", Pid);
+    snprintf(Prefix.szPidTid, FIELD_SIZE, "[%d]", Pid);
   } else {
-    snprintf(pPrefix->szPidTid, FIELD_SIZE, "[%d][%d]", Pid, Tid);
+    snprintf(Prefix.szPidTid, FIELD_SIZE, "[%d][%d]", Pid, Tid);
   }
-  if (szCateg != nullptr && szLevel != nullptr) {
-    snprintf(pPrefix->szCategLevel, FIELD_SIZE, "[%s][%s]", szCateg, szLevel);
+  if (From.szCateg != nullptr && From.szLevel != nullptr) {
+    snprintf(Prefix.szCategLevel, FIELD_SIZE, "[%s][%s]", From.szCateg, From.szLevel);
   }
+  Prefix.szFile = From.szFile + BaseNameOffset(From.szFile);
+  Prefix.LineNo = From.LineNo;
+  Prefix.szFunc = From.szFunc;
+  return Prefix;
+}
+
+// Formats a line into szLine (LINE_SIZE bytes). Errno is for "%m". Returns the length, or 0 if the
+// line does not fit or snprintf cannot format it completely.
+__attribute__((format(printf, 4, 0))) size_t FormatLine(char* szLine, const LinePrefix& Prefix,
+                                                        int Errno, const char* szFormat,
+                                                        va_list Args) {
+  const auto PrefixLen = static_cast<size_t>(
+      snprintf(szLine, LINE_SIZE, PREFIX_FORMAT, Prefix.szTime, Prefix.szPidTid,
+               Prefix.szCategLevel, Prefix.szFile, Prefix.LineNo, Prefix.szFunc));
+  if (PrefixLen >= LINE_SIZE) {  // so is the -1 of a failure, as a size_t
+    return 0;
+  }
+  const size_t Left = LINE_SIZE - PrefixLen;
+  errno = Errno;
+  const auto MessageLen = static_cast<size_t>(vsnprintf(szLine + PrefixLen, Left, szFormat, Args));
+  return MessageLen < Left ? PrefixLen + MessageLen : 0;
+}
+
+// Needs no heap and one write. Unlocks and closes Fd.
+void WriteAtOnce(int Fd, const char* szLine, size_t Len) {
+  fileops::WriteAll(Fd, szLine, Len);  // deliberately not reported: a full disk
+  KiFlock::UnLock(Fd);
+  close(Fd);
+}
+
+// Writes a line of any length, and as much as can be formatted. Unlocks and closes Fd.
+__attribute__((format(printf, 4, 0))) void WriteThroughStream(int Fd, const LinePrefix& Prefix,
+                                                              int Errno, const char* szFormat,
+                                                              va_list Args) {
+  FILE* pStream = fdopen(Fd, "a");
+  if (pStream == nullptr) {
+    ReportLostLine(__LINE__, "fdopen");
+    close(Fd);
+    return;
+  }
+  fprintf(pStream, PREFIX_FORMAT, Prefix.szTime, Prefix.szPidTid, Prefix.szCategLevel,
+          Prefix.szFile, Prefix.LineNo, Prefix.szFunc);
+  errno = Errno;
+  vfprintf(pStream, szFormat, Args);
+  fflush(pStream);
+  KiFlock::UnLock(Fd);
+  fclose(pStream);
 }
 
 // Writes one line and keeps the caller's errno, which "%m" in the message gives. Call with thread
-// cancellation disabled. A line of usual length needs no heap and one write. A longer line, or one
-// that snprintf cannot format completely, is written through a stream.
-__attribute__((format(printf, 7, 0))) void WriteLine(LOG_TYPE LogType, const char* szCateg,
-                                                     const char* szLevel, const char* szFile,
-                                                     int LineNo, const char* szFunc,
+// cancellation disabled.
+__attribute__((format(printf, 3, 0))) void WriteLine(LOG_TYPE LogType, const Origin& From,
                                                      const char* szFormat, va_list Args) {
   const fileops::ErrnoKeeper Errno;
   const int Fd = OpenLog(LogType);
   if (Fd == -1) {
     return;
   }
-  szFile += BaseNameOffset(szFile);
-  LinePrefix Prefix;
-  FillPrefix(&Prefix, szCateg, szLevel);
+  const LinePrefix Prefix = MakePrefix(From);
   char szLine[LINE_SIZE];
-  auto Len =
-      static_cast<size_t>(snprintf(szLine, LINE_SIZE, PREFIX_FORMAT, Prefix.szTime, Prefix.szPidTid,
-                                   Prefix.szCategLevel, szFile, LineNo, szFunc));
-  if (Len < LINE_SIZE) {
-    va_list Copy;
-    va_copy(Copy, Args);
-    errno = Errno.Get();
-    // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): the caller called va_start
-    const int MessageLen = vsnprintf(szLine + Len, LINE_SIZE - Len, szFormat, Copy);
-    va_end(Copy);
-    Len = MessageLen < 0 ? LINE_SIZE : Len + static_cast<size_t>(MessageLen);
-  }
-  if (Len < LINE_SIZE) {
-    fileops::WriteAll(Fd, szLine, Len);  // deliberately not reported: a full disk
-    KiFlock::UnLock(Fd);
-    close(Fd);
-  } else if (FILE* pStream = fdopen(Fd, "a")) {
-    fprintf(pStream, PREFIX_FORMAT, Prefix.szTime, Prefix.szPidTid, Prefix.szCategLevel, szFile,
-            LineNo, szFunc);
-    errno = Errno.Get();
-    // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized)
-    vfprintf(pStream, szFormat, Args);
-    fflush(pStream);
-    KiFlock::UnLock(Fd);
-    fclose(pStream);
+  va_list Copy;
+  va_copy(Copy, Args);
+  const size_t Len = FormatLine(szLine, Prefix, Errno.Get(), szFormat, Copy);
+  va_end(Copy);
+  if (Len > 0) {
+    WriteAtOnce(Fd, szLine, Len);
   } else {
-    ReportLostLine(__LINE__, "fdopen");
-    close(Fd);
+    WriteThroughStream(Fd, Prefix, Errno.Get(), szFormat, Args);
   }
 }
 
@@ -187,7 +223,7 @@ void KiPrintf(LOG_TYPE LogType, const char* szCateg, const char* szLevel, const 
   pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, nullptr);
   va_list Args;
   va_start(Args, szFormat);
-  WriteLine(LogType, szCateg, szLevel, szFile, LineNo, szFunc, szFormat, Args);
+  WriteLine(LogType, {szCateg, szLevel, szFile, LineNo, szFunc}, szFormat, Args);
   va_end(Args);
   pthread_setcancelstate(PTHREAD_CANCEL_ENABLE, nullptr);
 }
@@ -199,7 +235,7 @@ void KiDbgPrintf(LOG_CATEG Categ, LOG_LEVEL Level, const char* szFile, int LineN
   const fileops::NoCancel Guard;
   va_list Args;
   va_start(Args, szFormat);
-  WriteLine(KI_LOG, szCateg, szLevel, szFile, LineNo, szFunc, szFormat, Args);
+  WriteLine(KI_LOG, {szCateg, szLevel, szFile, LineNo, szFunc}, szFormat, Args);
   va_end(Args);
 }
 
