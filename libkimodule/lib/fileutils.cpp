@@ -56,17 +56,21 @@ int ParseKeyVal(std::string_view Line, std::string_view& Key, std::string_view& 
   return 0;
 }
 
-// Adds the pairs of szFile to KeyVals, except for keys that it has already. Sets Match to the
-// number of lines with a pair, or leaves it unchanged if the file cannot be opened. If pKeys is not
-// null, only its keys count. Returns 0, or the errno of the failed open or read.
-int ReadKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals, int& Match) {
+struct ReadResult {
+  int Match;  // the number of lines with a pair that counts; -1 if the file cannot be opened
+  int Errno;  // of the failed open or read; 0 if the whole file was read
+};
+
+// Adds the pairs of szFile to KeyVals, except for keys that it has already. If pKeys is not null,
+// only its keys count.
+ReadResult ReadKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals) {
   char rgBuf[4096];  // must outlive the stream; saves it asking the system for a size
   const File pFile = Open(szFile);
   if (pFile == nullptr) {
-    return errno;
+    return {-1, errno};
   }
   setvbuf(pFile.get(), rgBuf, _IOFBF, sizeof(rgBuf));
-  Match = 0;
+  int Match = 0;
   LineBuffer Buffer;
   std::string_view Key;
   std::string_view Val;
@@ -92,7 +96,7 @@ int ReadKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals, int
     }
   }
   const int Errno = errno;
-  return feof(pFile.get()) != 0 ? 0 : Errno;
+  return {Match, feof(pFile.get()) != 0 ? 0 : Errno};
 }
 
 // Waits for the lock without a time limit. A signal handler without SA_RESTART ends the wait of
@@ -113,22 +117,22 @@ int GetKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals) {
              errno);
     return -1;
   }
-  int Match = -1;
-  const int Errno = ReadKeyVals(szFile, pKeys, KeyVals, Match);
-  if (Match == -1) {
+  const ReadResult Result = ReadKeyVals(szFile, pKeys, KeyVals);
+  if (Result.Match == -1) {
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to open file [%s] with errno [%d]\n", szFile,
-             Errno);
+             Result.Errno);
   }
-  return Match;
+  return Result.Match;
 }
 
-// Cancelling a thread in the middle of a change would leave a temporary file and a lock.
-class CancelDisabler {
+// Cancelling a thread in the middle of a change would leave a temporary file and a lock. Always
+// enables cancellation at the end, unlike fileops::NoCancel.
+class DisableThenEnableCancel {
  public:
-  CancelDisabler() { pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, nullptr); }
-  ~CancelDisabler() { pthread_setcancelstate(PTHREAD_CANCEL_ENABLE, nullptr); }
-  CancelDisabler(const CancelDisabler&) = delete;
-  CancelDisabler& operator=(const CancelDisabler&) = delete;
+  DisableThenEnableCancel() { pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, nullptr); }
+  ~DisableThenEnableCancel() { pthread_setcancelstate(PTHREAD_CANCEL_ENABLE, nullptr); }
+  DisableThenEnableCancel(const DisableThenEnableCancel&) = delete;
+  DisableThenEnableCancel& operator=(const DisableThenEnableCancel&) = delete;
 };
 
 // Creates "szTemplate.tmp.XXXXXX" (mode 0600) with a unique name. Returns its descriptor, which the
@@ -220,7 +224,7 @@ int UpdateKeyVals(const char* szFile, const KeyValMap& AddKeyVals, const KeySet&
   if (AddKeyVals.empty() && DelKeys.empty()) {
     return 0;
   }
-  const CancelDisabler NoCancel;
+  const DisableThenEnableCancel Cancel;
   KiFlock Lock(szFile);
   if (LockCurrent(Lock) != 0) {
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to lock file [%s] with errno [%d]\n", szFile,
@@ -228,12 +232,11 @@ int UpdateKeyVals(const char* szFile, const KeyValMap& AddKeyVals, const KeySet&
     return -1;
   }
   KeyValMap KeyVals;
-  int Match = 0;
-  const int Errno = ReadKeyVals(szFile, nullptr, KeyVals, Match);
-  if (Errno != 0) {
+  const ReadResult Result = ReadKeyVals(szFile, nullptr, KeyVals);
+  if (Result.Errno != 0) {
     // A failed read ends here too: what was read so far must not become the whole file.
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to open file [%s] with errno [%d]\n", szFile,
-             Errno);
+             Result.Errno);
     return -1;
   }
   for (const auto& [strKey, strVal] : AddKeyVals) {
