@@ -18,12 +18,12 @@
 
 #include "kidebuglog.h"
 #include "kiflock.h"
+#include "settings.h"
 #include "utils.h"
 
 namespace {
 
 constexpr const char* PACKAGE_DIR = "/var/packages/Camveld";
-constexpr const char* SETTINGS_FILE = "/var/packages/Camveld/etc/settings.conf";
 constexpr LOG_LEVEL DEFAULT_LEVEL = LOG_LEVEL_NOTICE;
 
 constexpr char USAGE[] =

@@ -25,6 +25,8 @@ int Descriptor::Close() {
     return 0;
   }
   const NoCancel Guard;
+  // Linux releases the descriptor even if close fails. To close it again might close another
+  // thread's.
   return close(std::exchange(m_Fd, -1));
 }
 
@@ -46,13 +48,14 @@ int TmpFile::RenameTo(const char* szFile) {
 }
 
 int CreateAnew(const char* szName) {
+  // O_EXCL: a link in this place is never followed.
   const auto Create = [szName] {
     return open(szName, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600);
   };
   const NoCancel Guard;
   const int Fd = Create();
   if (Fd == -1 && errno == EEXIST && unlink(szName) == 0) {
-    return Create();
+    return Create();  // once: somebody without the lock could go on creating the file
   }
   return Fd;
 }

@@ -20,6 +20,7 @@
 #include "fileops.h"
 #include "fileutils.h"
 #include "kiflock.h"
+#include "settings.h"
 #include "utils.h"
 
 pid_t g_DbgLogPid = 0;
@@ -250,7 +251,6 @@ namespace {
 [[gnu::used]] constexpr LOG_LEVEL (KiDbgLogCfg::*GET_PID_LEVEL)(pid_t) const =
     &KiDbgLogCfg::GetPidLevel;
 
-constexpr const char* SETTINGS_FILE = "/var/packages/Camveld/etc/settings.conf";
 constexpr const char* LEVELS_KEY = "ki_dbglog_settings";  // by category, separated by commas
 constexpr const char* IN_MS_KEY = "ki_dbglog_time_scale";
 

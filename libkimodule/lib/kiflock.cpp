@@ -30,6 +30,7 @@ int KiFlock::LockEx(int TimeoutSec) { return Flock(TimeoutSec, true); }
 bool KiFlock::IsCurrent() const {
   struct stat Open;
   struct stat Named;
+  // A replaced file has the name, but another inode.
   return fstat(m_Fd, &Open) == 0 && stat(m_strName.c_str(), &Named) == 0 &&
          Open.st_dev == Named.st_dev && Open.st_ino == Named.st_ino;
 }
@@ -39,7 +40,7 @@ void KiFlock::UnLock() {
     return;
   }
   const fileops::NoCancel Guard;  // the destructor calls this too
-  UnLock(m_Fd);
+  UnLock(m_Fd);  // close alone keeps the lock while a forked child has the file open
   close(m_Fd);
   m_Fd = -1;
 }
@@ -52,6 +53,7 @@ int KiFlock::Lock(int Fd, int TimeoutSec, bool blExclusive) {
   if (TimeoutSec == 0) {
     return flock(Fd, Operation | LOCK_NB);
   }
+  // flock has no time limit of its own, and an alarm would be the whole process's.
   int Ret = -1;
   int Errno = 0;
   for (int64_t Left = int64_t{TimeoutSec} * ATTEMPTS_PER_SEC; Left > 0; --Left) {
@@ -71,6 +73,7 @@ int KiFlock::UnLock(int Fd) { return flock(Fd, LOCK_UN); }
 int KiFlock::Flock(int TimeoutSec, bool blExclusive) {
   if (m_Fd == -1) {
     const fileops::NoCancel Guard;
+    // flock needs no permission to write.
     m_Fd = open(m_strName.c_str(), O_RDONLY | O_CREAT | O_CLOEXEC, 0644);
     if (m_Fd == -1) {
       return -1;

@@ -36,7 +36,9 @@ int HexDigit(char Character) {
   return -1;
 }
 
-char toHex(unsigned Nibble) { return static_cast<char>(Nibble > 9 ? Nibble + 55 : Nibble + 48); }
+char toHex(unsigned Nibble) {
+  return static_cast<char>(Nibble > 9 ? 'A' + Nibble - 10 : '0' + Nibble);
+}
 
 }  // namespace
 
@@ -47,7 +49,7 @@ std::string GetBaseName(const std::string& strFullPath) {
 std::string itos(int64_t i) { return std::to_string(i); }
 
 int32_t Hex2Dec(const char* pHex, int32_t Len) {
-  uint32_t Value = 0;
+  uint32_t Value = 0;  // unsigned: may overflow, then the last eight digits count
   for (int32_t Idx = 0; Idx < Len; ++Idx) {
     const int Digit = HexDigit(pHex[Idx]);
     if (Digit == -1) {
@@ -68,7 +70,7 @@ std::string urlEncoding(const std::string& strInput, const std::string& strExtra
   };
   Set("ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789_~()*,-.", UNENCODED);
   Set(strExtraUrlUnencodedChars, UNENCODED);
-  Set(" \t\n\v\f\r", WHITE);
+  Set(" \t\n\v\f\r", WHITE);  // last: also white space among the extra characters becomes %20
 
   std::string strOutput;
   strOutput.reserve(strInput.size());
@@ -102,7 +104,7 @@ std::string Trim(const std::string& strOrig, const char* szChars) {
 
 char* Strncpy(char* szDst, const char* szSrc, size_t BufLen) {
   if (BufLen > 0) {
-    strncpy(szDst, szSrc, BufLen - 1);
+    strncpy(szDst, szSrc, BufLen - 1);  // zeroes the rest
     szDst[BufLen - 1] = '\0';
   }
   return szDst;
@@ -129,6 +131,7 @@ char* HttpBase64Encode(const char* src) {
   static const char szAlphabet[] =
       "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
   const size_t Len = strlen(src);
+  // malloc and not new: the caller uses free().
   char* const szText = static_cast<char*>(malloc((Len + 2) / 3 * 4 + 1));
   if (szText == nullptr) {
     return nullptr;
@@ -162,6 +165,7 @@ std::vector<int32_t> String2IntVector(const std::string& strValue, const std::st
   if (strValue.empty() || strDelim.empty()) {
     return Numbers;
   }
+  // strtok_r writes into the text that it splits.
   const std::unique_ptr<char, decltype(&free)> pCopy(strdup(strValue.c_str()), free);
   if (pCopy == nullptr) {
     return Numbers;
@@ -180,6 +184,7 @@ double GetAbsTimeDiffBySec(time_t EndTime, time_t StartTime) {
 
 int64_t GetAbsTimeDiffUSec(const timeval& tvOld, const timeval& tvNew) {
   const int64_t Diff = GetTimeDiffUSec(tvOld, tvNew);
+  // unsigned: the lowest number has no positive counterpart
   return Diff < 0 ? static_cast<int64_t>(-static_cast<uint64_t>(Diff)) : Diff;
 }
 
@@ -211,6 +216,7 @@ int32_t WriteFd(int Fd, const void* pBuf, int32_t BufLen) {
     if (Len > 0) {
       Written += static_cast<int32_t>(Len);
     } else if (Len == 0) {
+      // Without progress and without an error, the loop might never end.
       if (++EmptyWrites > MAX_EMPTY_WRITES) {
         break;
       }
@@ -233,7 +239,7 @@ bool CreateThread(ThreadFunc FuncPtr, void* FuncParam, uint32_t StackSize, bool 
                   pthread_t& ThreadId) {
   pthread_attr_t Attr;
   pthread_attr_init(&Attr);
-  if (StackSize != 0) {
+  if (StackSize != 0) {  // a size that the system refuses leaves the default
     pthread_attr_setstacksize(&Attr, StackSize);
   }
   if (blSetDetach) {
