@@ -1,6 +1,7 @@
 """The library in programs: from start to end, in failing calls, together."""
 
 import errno
+import fcntl
 import os
 import re
 import time
@@ -56,6 +57,15 @@ def test_a_failing_call_is_logged_and_leaves_the_file(
     assert ended.returncode == 1
     assert file.read_text() == text
     assert os.listdir(file.parent) == ["f"]
+
+
+def test_a_log_that_stays_locked_loses_a_line_and_holds_nobody(appliance):
+    no_time_passes = [*STRACE, "-e", "inject=/nanosleep:retval=0"]
+    client = appliance.command(CLIENT, "get", "/missing/f", "key")
+    with appliance.log_file.open("w") as log:
+        fcntl.flock(log, fcntl.LOCK_SH)
+        assert run(*no_time_passes, *client).returncode == 1
+    assert appliance.log() == []
 
 
 def test_lines_stay_whole_and_in_order_while_the_log_is_rotated(appliance):

@@ -25,6 +25,9 @@ using Numbers = std::vector<int32_t>;
 
 constexpr const char* NAME = "/var/services/camveld/f";
 
+constexpr time_t SEC_EAST = 50400;  // 14 hours, so that local time is never UTC
+[[maybe_unused]] const int TZ_SET = setenv("TZ", "EAST-14", 1);
+
 class KeyVal : public PrivateVar {};
 
 // Its configuration lets through what is as severe as an alarm.
@@ -182,6 +185,7 @@ TEST_F(KeyVal, LockExcludesOthersAsLongAsItIsTold) {
   EXPECT_EQ(Held.LockEx(0), -1);
   Other.UnLock();
   EXPECT_EQ(Held.LockEx(0), 0);  // converts the lock it has
+  EXPECT_NE(system("ls -l /proc/self/fd | grep -q camveld/f"), 0) << "inherited";
   Interrupt();
   const int64_t usecStart = GetCurTimestamp();
   ualarm(10000, 10000);
@@ -196,6 +200,11 @@ TEST_F(Log, LineHasEachFieldInItsPlace) {
   KiPrintf(NOTIFICATION_LOG, nullptr, "error", "f", -1, "Fn", "other\n");
   EXPECT_EQ(LogText(), "[utils][error] c.cpp:Fn(): v=5 %\n");
   const std::string strOther = ReadFile("/var/log/camveld/kinotification.log");
+  tm Local = {};
+  const time_t Now = time(nullptr) + SEC_EAST;
+  gmtime_r(&Now, &Local);  // for the year
+  strptime(strOther.c_str(), "%b %e %T", &Local);
+  EXPECT_NEAR(static_cast<double>(timegm(&Local) - Now), 0, 60);
   EXPECT_EQ(strOther.substr(15), " [" + itos(getpid()) + "] f:-1:Fn(): other\n");
   EXPECT_EQ(Rights(LOG_FILE)[0], S_IFREG | 0666U);
 }
@@ -247,6 +256,10 @@ TEST_F(Log, ConfigurationKeepsItsLayoutAndItsBounds) {
   }
   EXPECT_EQ(Numbers(pWords, pWords + 2), (Numbers{0, 256}));
   EXPECT_EQ(Numbers(pWords + 512, pWords + 518), (Numbers{767, 2, 102, 5, 164, 1}));
+  pWords[513] = INT32_MAX;  // another program may store any count
+  EXPECT_EQ(m_Cfg.GetPidLevel(166), LOG_LEVEL_ALARM);
+  m_Cfg.Init(0);
+  EXPECT_EQ(Numbers(pWords + 513, pWords + 516), (Numbers{0, 0, 0}));
 }
 
 std::string Base64(const char* szText) {
@@ -273,10 +286,39 @@ TEST(Utils, Texts) {
 }
 
 TEST(Utils, Numbers) {
+  EXPECT_EQ(GetISO8601TimeText(1700000000123999), "20231114T221320.123Z");
   EXPECT_EQ(Hex2Dec("09afAF", 6), 0x09afaf);
   EXPECT_EQ(Hex2Dec("a0g1", 4), 0xa0);
   EXPECT_EQ(String2IntVector("1;;x, -7,012x,+3;", ",;"), (Numbers{1, 0, -7, 12, 3}));
   EXPECT_EQ(String2IntVector("4294967296,-2147483649", ","), (Numbers{INT32_MAX, INT32_MIN}));
+}
+
+// Stores the calling thread's detach state in the atomic int at pState.
+void* StoreDetachState(void* pState) {
+  pthread_attr_t Attr;
+  int State = -1;
+  pthread_getattr_np(pthread_self(), &Attr);
+  pthread_attr_getdetachstate(&Attr, &State);
+  pthread_attr_destroy(&Attr);
+  *static_cast<std::atomic<int>*>(pState) = State;
+  return nullptr;
+}
+
+TEST(Utils, ThreadIsDetachedOrNot) {
+  for (const int Expected : {PTHREAD_CREATE_JOINABLE, PTHREAD_CREATE_DETACHED}) {
+    static std::atomic<int> State;
+    State = -1;
+    const bool blDetach = Expected == PTHREAD_CREATE_DETACHED;
+    pthread_t Id;
+    ASSERT_TRUE(CreateThread(StoreDetachState, &State, 0, blDetach, Id));
+    while (State == -1) {
+      usleep(1000);
+    }
+    EXPECT_EQ(State, Expected);
+    if (!blDetach) {
+      pthread_join(Id, nullptr);
+    }
+  }
 }
 
 // The milliseconds that a tick takes.
