@@ -94,6 +94,26 @@ LOG_LEVEL ParseLevel(const std::string& strText) {
   return Parse("level", strText, LOG_LEVEL_TOTAL);
 }
 
+// Returns the categories of a list with commas.
+std::vector<LOG_CATEG> ParseCategs(const std::string& strList) {
+  std::vector<LOG_CATEG> Categs;
+  if (strList == "all") {
+    for (int Number = 0; Number < LOG_CATEG_TOTAL; ++Number) {
+      Categs.push_back(static_cast<LOG_CATEG>(Number));
+    }
+    return Categs;
+  }
+  size_t Begin = 0;
+  size_t Comma = 0;
+  do {
+    Comma = strList.find(',', Begin);
+    const std::string strName = strList.substr(Begin, Comma - Begin);
+    Categs.push_back(Parse("category", strName, LOG_CATEG_TOTAL));
+    Begin = Comma + 1;
+  } while (Comma != std::string::npos);
+  return Categs;
+}
+
 // Another program may have stored a number that is not a level.
 std::string LevelText(LOG_LEVEL Level) {
   return Level >= 0 && Level < LOG_LEVEL_TOTAL ? Enum2String(Level) : itos(Level);
@@ -147,15 +167,19 @@ std::string ProcessName(pid_t Pid) {
 
 // --- The commands ---
 
-using WordList = std::vector<std::string>;  // the arguments of a command
+// What stands behind the name of a command.
+struct Arguments {
+  std::vector<std::string> Words;
+  bool blAll = false;  // the option --all
+};
 
-void Print(bool blAll) {
+void Show(const Arguments& Args) {
   const KiDbgLogCfg& Cfg = Attach();
   int Shown = 0;
   for (int Number = 0; Number < LOG_CATEG_TOTAL; ++Number) {
     const auto Categ = static_cast<LOG_CATEG>(Number);
     const LOG_LEVEL Level = Cfg.GetLogLevel(Categ);
-    if (blAll || Level != DEFAULT_LEVEL) {
+    if (Args.blAll || Level != DEFAULT_LEVEL) {
       printf("category %d (%s): %s\n", Number, Enum2String(Categ), LevelText(Level).c_str());
       ++Shown;
     }
@@ -172,21 +196,9 @@ void Print(bool blAll) {
   printf("milliseconds: %s\n", Cfg.LogInMs() ? "on" : "off");
 }
 
-void Show(const WordList& /*Words*/) { Print(false); }
-
-void ShowAll(const WordList& /*Words*/) { Print(true); }
-
-void Set(const WordList& Words) {
-  const LOG_LEVEL Level = ParseLevel(Words[1]);
-  std::vector<LOG_CATEG> Categs;
-  for (int Number = 0; Words[0] == "all" && Number < LOG_CATEG_TOTAL; ++Number) {
-    Categs.push_back(static_cast<LOG_CATEG>(Number));
-  }
-  std::string strRest = Categs.empty() ? Words[0] + "," : "";
-  for (size_t Comma; (Comma = strRest.find(',')) != std::string::npos;) {
-    Categs.push_back(Parse("category", strRest.substr(0, Comma), LOG_CATEG_TOTAL));
-    strRest.erase(0, Comma + 1);
-  }
+void Set(const Arguments& Args) {
+  const std::vector<LOG_CATEG> Categs = ParseCategs(Args.Words[0]);
+  const LOG_LEVEL Level = ParseLevel(Args.Words[1]);
   KiDbgLogCfg& Cfg = Attach();
   for (const LOG_CATEG Categ : Categs) {
     Cfg.SetLogLevel(Categ, Level);
@@ -212,26 +224,29 @@ void SetPid(pid_t Pid, LOG_LEVEL Level) {
   }
 }
 
-void ChangePid(const WordList& Words) {
-  const auto Pid = static_cast<pid_t>(strtol(Words[0].c_str(), nullptr, 10));
-  if (Pid <= 0 || itos(Pid) != Words[0]) {
-    Fail(MISUSED, "not a process id: '%s'", Words[0].c_str());
+void ChangePid(const Arguments& Args) {
+  const std::string& strPid = Args.Words[0];
+  const std::string& strLevel = Args.Words[1];
+  const auto Pid = static_cast<pid_t>(strtol(strPid.c_str(), nullptr, 10));
+  if (Pid <= 0 || itos(Pid) != strPid) {
+    Fail(MISUSED, "not a process id: '%s'", strPid.c_str());
   }
-  if (Words[1] == "clear") {
+  if (strLevel == "clear") {
     ClearPid(Pid);
   } else {
-    SetPid(Pid, ParseLevel(Words[1]));
+    SetPid(Pid, ParseLevel(strLevel));
   }
 }
 
-void SetMs(const WordList& Words) {
-  if (Words[0] != "on" && Words[0] != "off") {
-    Fail(MISUSED, "milliseconds are on or off, not '%s'", Words[0].c_str());
+void SetMs(const Arguments& Args) {
+  const std::string& strSwitch = Args.Words[0];
+  if (strSwitch != "on" && strSwitch != "off") {
+    Fail(MISUSED, "milliseconds are on or off, not '%s'", strSwitch.c_str());
   }
-  Attach().SetLogInMs(Words[0] == "on");
+  Attach().SetLogInMs(strSwitch == "on");
 }
 
-void Create(const WordList& /*Words*/) {
+void Create(const Arguments& /*Args*/) {
   int Id = shmget(KiShmDbgLogIPCKey(), 0, 0);
   if (Id == -1 && errno == ENOENT) {
     Id = shmget(KiShmDbgLogIPCKey(), sizeof(KiDbgLogCfg), IPC_CREAT | 0666);
@@ -258,7 +273,7 @@ void Create(const WordList& /*Words*/) {
   }
 }
 
-void Load(const WordList& /*Words*/) {
+void Load(const Arguments& /*Args*/) {
   const int Found = Attach().LoadDbgLogSettings();
   if (Found <= 0) {
     Fail(REFUSED, "nothing loaded from %s: %s", SETTINGS_FILE,
@@ -266,7 +281,7 @@ void Load(const WordList& /*Words*/) {
   }
 }
 
-void Save(const WordList& /*Words*/) {
+void Save(const Arguments& /*Args*/) {
   if (Attach().SaveDbgLogSettings() != 0) {
     Fail(REFUSED, "cannot write %s: %s", SETTINGS_FILE, strerror(errno));
   }
@@ -274,22 +289,21 @@ void Save(const WordList& /*Words*/) {
 
 struct CommandRow {
   const char* szName;
-  size_t Words;
-  void (*pRun)(const WordList& Words);
+  size_t Words;     // how many words it takes
+  bool blTakesAll;  // whether it takes the option --all
+  void (*pRun)(const Arguments& Args);
 };
 
 constexpr CommandRow rgCommand[] = {
-    {"show", 0, Show}, {"show --all", 0, ShowAll}, {"set", 2, Set},   {"pid", 2, ChangePid},
-    {"ms", 1, SetMs},  {"create", 0, Create},      {"load", 0, Load}, {"save", 0, Save},
+    {"show", 0, true, Show},  {"set", 2, false, Set},       {"pid", 2, false, ChangePid},
+    {"ms", 1, false, SetMs},  {"create", 0, false, Create}, {"load", 0, false, Load},
+    {"save", 0, false, Save},
 };
 
-const CommandRow& FindCommand(const std::string& strName, const WordList& Words) {
+CommandRow FindCommand(const std::string& strName) {
   for (const CommandRow& Command : rgCommand) {
-    if (strName == Command.szName && Words.size() == Command.Words) {
-      return Command;
-    }
     if (strName == Command.szName) {
-      Fail(MISUSED, "wrong arguments for '%s', see 'kidbglog --help'", Command.szName);
+      return Command;
     }
   }
   Fail(MISUSED, "no command '%s', see 'kidbglog --help'", strName.c_str());
@@ -314,11 +328,11 @@ int main(int argc, char* argv[]) {
       {"version", no_argument, nullptr, 'V'},
       {},
   };
-  bool blAll = false;
+  Arguments Args;
   for (int Option; (Option = getopt_long(argc, argv, "", rgOption, nullptr)) != -1;) {
     switch (Option) {
       case 'a':
-        blAll = true;
+        Args.blAll = true;
         break;
       case 'h':
         fputs(USAGE, stdout);
@@ -330,15 +344,17 @@ int main(int argc, char* argv[]) {
         return MISUSED;
     }
   }
-  WordList Words(argv + optind, argv + argc);
   std::string strName = "show";
-  if (!Words.empty()) {
-    strName = Words[0];
-    Words.erase(Words.begin());
+  if (optind < argc) {
+    strName = argv[optind++];
   }
-  const CommandRow& Command = FindCommand(strName + (blAll ? " --all" : ""), Words);
+  Args.Words.assign(argv + optind, argv + argc);
+  const CommandRow Command = FindCommand(strName);
+  if (Args.Words.size() != Command.Words || (Args.blAll && !Command.blTakesAll)) {
+    Fail(MISUSED, "wrong arguments for '%s', see 'kidbglog --help'", Command.szName);
+  }
   Lock();
-  Command.pRun(Words);
+  Command.pRun(Args);
   if (fflush(stdout) != 0) {
     Fail(REFUSED, "cannot write: %s", strerror(errno));
   }

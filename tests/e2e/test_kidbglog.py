@@ -1,5 +1,6 @@
 """kidbglog on an appliance with shared memory, settings and log of its own."""
 
+import shlex
 import time
 from pathlib import Path
 from subprocess import DEVNULL, Popen
@@ -14,7 +15,7 @@ def kidbglog(appliance):
 
     def run_kidbglog(arguments):
         """Returns status and output."""
-        command = appliance.command(KIDBGLOG, *arguments.split())
+        command = appliance.command(KIDBGLOG, *shlex.split(arguments))
         ended = run(*command)
         return f"{ended.returncode} {ended.stdout}".strip()
 
@@ -67,6 +68,9 @@ MESSAGES = [
     (2568, "load", "1 nothing loaded from /var/packages/Camveld/etc/"),
     (2568, "pid 4194305 info", "1 there is no process 4194305"),
     (0, "set rtps debug", "2 no category 'rtps', the nearest is 'rtp'"),
+    (0, "create --all", "2 wrong arguments for 'create', see"),
+    (0, "'show --all'", "2 no command 'show --all', see"),
+    (0, "set utils, debug", "2 no category '', see"),
     (0, "set utils warning", "2 no level 'warning', the nearest is 'warn'"),
 ]
 
