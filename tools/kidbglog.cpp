@@ -70,10 +70,18 @@ size_t EditDistance(const std::string& strFrom, const std::string& strTo) {
   return Row.back();
 }
 
+std::string ToLower(std::string strText) {
+  for (char& Letter : strText) {
+    Letter = Letter >= 'A' && Letter <= 'Z' ? static_cast<char>(Letter - 'A' + 'a') : Letter;
+  }
+  return strText;
+}
+
 // Returns the value of T, below Total, whose name or number is strText. Ends the program if none
-// is.
+// is, with the nearest name, if one is near in whatever case.
 template <typename T>
 T Parse(const char* szKind, const std::string& strText, T Total) {
+  const std::string strLower = ToLower(strText);
   size_t NearestDistance = std::min<size_t>(3, (strText.size() + 1) / 2) + 1;
   std::string strHint = ", see 'kidbglog --help'";
   for (int Number = 0; Number < Total; ++Number) {
@@ -81,7 +89,7 @@ T Parse(const char* szKind, const std::string& strText, T Total) {
     if (strText == strName || strText == itos(Number)) {
       return static_cast<T>(Number);
     }
-    const size_t Distance = EditDistance(strText, strName);
+    const size_t Distance = EditDistance(strLower, strName);
     if (Distance < NearestDistance) {
       NearestDistance = Distance;
       strHint = ", the nearest is '" + strName + "'";

@@ -67,7 +67,7 @@ MESSAGES = [
     (100, "show", "1 the segment has 100 bytes, not 2568"),
     (2568, "load", "1 nothing loaded from /var/packages/Camveld/etc/"),
     (2568, "pid 4194305 info", "1 there is no process 4194305"),
-    (0, "set rtps debug", "2 no category 'rtps', the nearest is 'rtp'"),
+    (0, "set db,RTPS debug", "2 no category 'RTPS', the nearest is 'rtp'"),
     (0, "create --all", "2 wrong arguments for 'create', see"),
     (0, "'show --all'", "2 no command 'show --all', see"),
     (0, "set utils, debug", "2 no category '', see"),
