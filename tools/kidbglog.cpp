@@ -263,8 +263,8 @@ void Create(const Arguments& /*Args*/) {
   if (Id == -1 || shmctl(Id, IPC_STAT, &Info) != 0) {
     Fail(REFUSED, "cannot create the configuration: %s", strerror(errno));
   }
-  if (Info.shm_segsz != sizeof(KiDbgLogCfg)) {
-    Fail(REFUSED, "there is a segment of %zu bytes already, not of %zu", size_t{Info.shm_segsz},
+  if (Info.shm_segsz < sizeof(KiDbgLogCfg)) {
+    Fail(REFUSED, "there is a segment of %zu bytes already, %zu are needed", size_t{Info.shm_segsz},
          sizeof(KiDbgLogCfg));
   }
   const bool blForAll = (Info.shm_perm.mode & 0777) == 0666;

@@ -1,5 +1,7 @@
 """kidbglog on an appliance with shared memory, settings and log of its own."""
 
+import ctypes
+import re
 import shlex
 import time
 from pathlib import Path
@@ -61,10 +63,23 @@ def test_saved_settings_come_back_and_show_tells_what_differs(kidbglog):
         )
 
 
+def make_segment(size):
+    flags = 0o1600  # IPC_CREAT, for this user only
+    return ctypes.CDLL(None).shmget(0x18180004, size, flags)
+
+
+def test_create_takes_a_larger_segment_and_opens_it_to_all(kidbglog):
+    make_segment(3000)
+    assert kidbglog("create") == "0"
+    segments = run("ipcs", "--shmems").stdout
+    assert re.search(r"0x18180004 .* 666 +3000 ", segments), segments
+
+
 MESSAGES = [
     # size of the segment, if there is one; command; status and message
     (0, "show", "1 cannot attach the configuration: there is none"),
     (100, "show", "1 the segment has 100 bytes, not 2568"),
+    (100, "create", "1 there is a segment of 100 bytes already, 2568 are"),
     (2568, "load", "1 nothing loaded from /var/packages/Camveld/etc/"),
     (2568, "pid 4194305 info", "1 there is no process 4194305"),
     (0, "set db,RTPS debug", "2 no category 'RTPS', the nearest is 'rtp'"),
@@ -78,6 +93,5 @@ MESSAGES = [
 @pytest.mark.parametrize("size, command, message", MESSAGES)
 def test_messages(appliance, kidbglog, size, command, message):
     if size:
-        shmget = f"ctypes.CDLL(None).shmget(0x18180004, {size}, 0o1666)"
-        run("python3", "-c", f"import ctypes; {shmget}")
+        make_segment(size)
     assert kidbglog(command).startswith(message.replace(" ", " kidbglog: ", 1))
