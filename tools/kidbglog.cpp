@@ -12,6 +12,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <fstream>
 #include <numeric>
 #include <string>
 #include <vector>
@@ -157,7 +158,20 @@ bool HasEntry(const KiDbgLogCfg& Cfg, pid_t Pid) {
   return false;
 }
 
-bool IsRunning(pid_t Pid) { return Pid > 0 && (kill(Pid, 0) == 0 || errno == EPERM); }
+// Whether Pid is a process. The id of a thread is none: kill takes it for its process, but no
+// process looks for its threshold under it.
+bool IsRunning(pid_t Pid) {
+  if (Pid <= 0 || (kill(Pid, 0) != 0 && errno != EPERM)) {
+    return false;
+  }
+  std::ifstream Status("/proc/" + itos(Pid) + "/status");
+  for (std::string strLine; std::getline(Status, strLine);) {
+    if (strLine.compare(0, 5, "Tgid:") == 0) {
+      return Trim(strLine.substr(5), "\t ") == itos(Pid);
+    }
+  }
+  return true;  // /proc can hide the processes of other users
+}
 
 // Replaces control characters: a process can choose a name that would control the terminal.
 std::string ProcessName(pid_t Pid) {

@@ -3,6 +3,7 @@
 import ctypes
 import re
 import shlex
+import threading
 import time
 from pathlib import Path
 from subprocess import DEVNULL, Popen
@@ -75,13 +76,25 @@ def test_create_takes_a_larger_segment_and_opens_it_to_all(kidbglog):
     assert re.search(r"0x18180004 .* 666 +3000 ", segments), segments
 
 
+def test_only_a_process_gets_a_threshold(kidbglog):
+    kidbglog("create")
+    stop = threading.Event()
+    thread = threading.Thread(target=stop.wait, daemon=True)
+    thread.start()
+    for number in thread.native_id, 4194305:
+        refusal = f"1 kidbglog: there is no process {number}"
+        assert kidbglog(f"pid {number} info") == refusal
+    stop.set()
+    thread.join()
+    assert "process" not in kidbglog("show")
+
+
 MESSAGES = [
     # size of the segment, if there is one; command; status and message
     (0, "show", "1 cannot attach the configuration: there is none"),
     (100, "show", "1 the segment has 100 bytes, not 2568"),
     (100, "create", "1 there is a segment of 100 bytes already, 2568 are"),
     (2568, "load", "1 nothing loaded from /var/packages/Camveld/etc/"),
-    (2568, "pid 4194305 info", "1 there is no process 4194305"),
     (0, "set db,RTPS debug", "2 no category 'RTPS', the nearest is 'rtp'"),
     (0, "create --all", "2 wrong arguments for 'create', see"),
     (0, "'show --all'", "2 no command 'show --all', see"),
