@@ -147,15 +147,20 @@ KiDbgLogCfg& Attach() {
   return *pCfg;
 }
 
-bool HasEntry(const KiDbgLogCfg& Cfg, pid_t Pid) {
-  pid_t Found = 0;
-  LOG_LEVEL Level;
-  for (int Idx = 0; Cfg.GetPidLevel(Idx, Found, Level) == 0; ++Idx) {
-    if (Found == Pid) {
-      return true;
-    }
+// Returns the table of processes.
+std::vector<__PidDbgLevel> Entries(const KiDbgLogCfg& Cfg) {
+  std::vector<__PidDbgLevel> Table;
+  __PidDbgLevel Entry = {};
+  while (Cfg.GetPidLevel(static_cast<int>(Table.size()), Entry.Pid, Entry.Level) == 0) {
+    Table.push_back(Entry);
   }
-  return false;
+  return Table;
+}
+
+bool HasEntry(const KiDbgLogCfg& Cfg, pid_t Pid) {
+  const std::vector<__PidDbgLevel> Table = Entries(Cfg);
+  return std::any_of(Table.begin(), Table.end(),
+                     [Pid](const __PidDbgLevel& Entry) { return Entry.Pid == Pid; });
 }
 
 // Whether Pid is a process. The id of a thread is none: kill takes it for its process, but no
@@ -209,9 +214,7 @@ void Show(const Arguments& Args) {
   if (Shown < LOG_CATEG_TOTAL) {
     printf("%s categories: %s\n", Shown == 0 ? "all" : "other", Enum2String(DEFAULT_LEVEL));
   }
-  pid_t Pid = 0;
-  LOG_LEVEL Level;
-  for (int Idx = 0; Cfg.GetPidLevel(Idx, Pid, Level) == 0; ++Idx) {
+  for (const auto& [Pid, Level] : Entries(Cfg)) {
     const std::string strName = IsRunning(Pid) ? " (" + ProcessName(Pid) + ")" : ", gone";
     printf("process %d%s: %s\n", Pid, strName.c_str(), LevelText(Level).c_str());
   }
@@ -235,12 +238,25 @@ void ClearPid(pid_t Pid) {
   Cfg.ClearPid(Pid);
 }
 
+void ClearGone(KiDbgLogCfg& Cfg) {
+  for (const __PidDbgLevel& Entry : Entries(Cfg)) {
+    if (!IsRunning(Entry.Pid)) {
+      Cfg.ClearPid(Entry.Pid);
+      printf("the table of processes was full: cleared process %d, which is gone\n", Entry.Pid);
+    }
+  }
+}
+
 void SetPid(pid_t Pid, LOG_LEVEL Level) {
   KiDbgLogCfg& Cfg = Attach();
   if (!IsRunning(Pid)) {
     Fail(REFUSED, "there is no process %d", Pid);
   }
   Cfg.SetPidLevel(Pid, Level);
+  if (!HasEntry(Cfg, Pid)) {  // the table is full
+    ClearGone(Cfg);
+    Cfg.SetPidLevel(Pid, Level);
+  }
   if (!HasEntry(Cfg, Pid)) {
     Fail(REFUSED, "the table of processes is full, 'kidbglog pid PID clear' makes room");
   }

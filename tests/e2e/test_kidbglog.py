@@ -1,8 +1,10 @@
 """kidbglog on an appliance with shared memory, settings and log of its own."""
 
 import ctypes
+import os
 import re
 import shlex
+import struct
 import threading
 import time
 from pathlib import Path
@@ -10,6 +12,9 @@ from subprocess import DEVNULL, Popen
 
 import pytest
 from conftest import CLIENT, KIDBGLOG, run
+
+LIBC = ctypes.CDLL(None)
+LIBC.shmat.restype = ctypes.c_void_p
 
 
 @pytest.fixture
@@ -65,8 +70,25 @@ def test_saved_settings_come_back_and_show_tells_what_differs(kidbglog):
 
 
 def make_segment(size):
+    """Returns its id."""
     flags = 0o1600  # IPC_CREAT, for this user only
-    return ctypes.CDLL(None).shmget(0x18180004, size, flags)
+    return LIBC.shmget(0x18180004, size, flags)
+
+
+def test_a_full_table_loses_only_the_processes_that_are_gone(kidbglog):
+    # Number and entries of the table: process, level.
+    table = struct.pack("=i", 64) + struct.pack("=ii", 1, 7) * 63
+    table += struct.pack("=ii", 4194305, 7)
+    segment = LIBC.shmat(make_segment(2568), None, 0)
+    ctypes.memmove(segment + 2052, table, len(table))
+    assert kidbglog(f"pid {os.getpid()} info") == (
+        "0 the table of processes was full: "
+        "cleared process 4194305, which is gone"
+    )
+    assert f"process {os.getpid()} " in kidbglog("show")
+    assert kidbglog(f"pid {os.getppid()} info").startswith(
+        "1 kidbglog: the table of processes is full"
+    )
 
 
 def test_create_takes_a_larger_segment_and_opens_it_to_all(kidbglog):
