@@ -25,6 +25,7 @@
 namespace {
 
 constexpr const char* PACKAGE_DIR = "/var/packages/Camveld";
+constexpr int LOCK_TIMEOUT_SEC = 10;
 constexpr LOG_LEVEL DEFAULT_LEVEL = LOG_LEVEL_NOTICE;
 
 constexpr char USAGE[] =
@@ -329,13 +330,15 @@ struct CommandRow {
   const char* szName;
   size_t Words;     // how many words it takes
   bool blTakesAll;  // whether it takes the option --all
+  bool blChanges;   // whether it needs the lock
   void (*pRun)(const Arguments& Args);
 };
 
 constexpr CommandRow rgCommand[] = {
-    {"show", 0, true, Show},  {"set", 2, false, Set},       {"pid", 2, false, ChangePid},
-    {"ms", 1, false, SetMs},  {"create", 0, false, Create}, {"load", 0, false, Load},
-    {"save", 0, false, Save},
+    {"show", 0, true, false, Show},     {"set", 2, false, true, Set},
+    {"pid", 2, false, true, ChangePid}, {"ms", 1, false, true, SetMs},
+    {"create", 0, false, true, Create}, {"load", 0, false, true, Load},
+    {"save", 0, false, true, Save},
 };
 
 CommandRow FindCommand(const std::string& strName) {
@@ -352,9 +355,14 @@ CommandRow FindCommand(const std::string& strName) {
 // not open the directory, there is no lock.
 void Lock() {
   const int Fd = open(PACKAGE_DIR, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
-  if (Fd != -1 && KiFlock::Lock(Fd, -1, true) != 0) {
-    Fail(REFUSED, "cannot lock %s: %s", PACKAGE_DIR, strerror(errno));
+  if (Fd == -1 || KiFlock::Lock(Fd, LOCK_TIMEOUT_SEC, true) == 0) {
+    return;
   }
+  if (errno == EWOULDBLOCK) {
+    Fail(REFUSED, "another command has held the lock on %s for %d seconds", PACKAGE_DIR,
+         LOCK_TIMEOUT_SEC);
+  }
+  Fail(REFUSED, "cannot lock %s: %s", PACKAGE_DIR, strerror(errno));
 }
 
 }  // namespace
@@ -391,7 +399,9 @@ int main(int argc, char* argv[]) {
   if (Args.Words.size() != Command.Words || (Args.blAll && !Command.blTakesAll)) {
     Fail(MISUSED, "wrong arguments for '%s', see 'kidbglog --help'", Command.szName);
   }
-  Lock();
+  if (Command.blChanges) {
+    Lock();
+  }
   Command.pRun(Args);
   if (fflush(stdout) != 0) {
     Fail(REFUSED, "cannot write: %s", strerror(errno));

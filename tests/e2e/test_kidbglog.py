@@ -1,6 +1,7 @@
 """kidbglog on an appliance with shared memory, settings and log of its own."""
 
 import ctypes
+import fcntl
 import os
 import re
 import shlex
@@ -11,7 +12,7 @@ from pathlib import Path
 from subprocess import DEVNULL, Popen
 
 import pytest
-from conftest import CLIENT, KIDBGLOG, run
+from conftest import CLIENT, KIDBGLOG, STRACE, run
 
 LIBC = ctypes.CDLL(None)
 LIBC.shmat.restype = ctypes.c_void_p
@@ -89,6 +90,20 @@ def test_a_full_table_loses_only_the_processes_that_are_gone(kidbglog):
     assert kidbglog(f"pid {os.getppid()} info").startswith(
         "1 kidbglog: the table of processes is full"
     )
+
+
+def test_changes_wait_for_each_other_and_show_for_none(kidbglog, appliance):
+    kidbglog("create")
+    directory = os.open("/var/packages/Camveld", os.O_RDONLY)
+    fcntl.flock(directory, fcntl.LOCK_SH)
+    no_time_passes = [*STRACE, "-e", "inject=/nanosleep:retval=0"]
+    for command, expected in [
+        ("show", "all categories: notice"),
+        ("ms on", "kidbglog: another command has held the lock on /var/"),
+    ]:
+        words = appliance.command(KIDBGLOG, *command.split())
+        assert run(*no_time_passes, *words).stdout.startswith(expected)
+    os.close(directory)
 
 
 def test_create_takes_a_larger_segment_and_opens_it_to_all(kidbglog):
