@@ -4,6 +4,7 @@
 #include <getopt.h>
 #include <signal.h>
 #include <sys/shm.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -285,7 +286,16 @@ void SetMs(const Arguments& Args) {
   Attach().SetLogInMs(strSwitch == "on");
 }
 
+// The library would open a pipe, and wait for its other end while this command holds the lock.
+void CheckSettingsFile() {
+  struct stat Stat;
+  if (stat(SETTINGS_FILE, &Stat) == 0 && !S_ISREG(Stat.st_mode)) {
+    Fail(REFUSED, "%s is not a regular file", SETTINGS_FILE);
+  }
+}
+
 void Create(const Arguments& /*Args*/) {
+  CheckSettingsFile();
   int Id = shmget(KiShmDbgLogIPCKey(), 0, 0);
   if (Id == -1 && errno == ENOENT) {
     Id = shmget(KiShmDbgLogIPCKey(), sizeof(KiDbgLogCfg), IPC_CREAT | 0666);
@@ -313,6 +323,7 @@ void Create(const Arguments& /*Args*/) {
 }
 
 void Load(const Arguments& /*Args*/) {
+  CheckSettingsFile();
   const int Found = Attach().LoadDbgLogSettings();
   if (Found <= 0) {
     Fail(REFUSED, "nothing loaded from %s: %s", SETTINGS_FILE,
@@ -321,6 +332,7 @@ void Load(const Arguments& /*Args*/) {
 }
 
 void Save(const Arguments& /*Args*/) {
+  CheckSettingsFile();
   if (Attach().SaveDbgLogSettings() != 0) {
     Fail(REFUSED, "cannot write %s: %s", SETTINGS_FILE, strerror(errno));
   }

@@ -25,7 +25,7 @@ def kidbglog(appliance):
     def run_kidbglog(arguments):
         """Returns status and output."""
         command = appliance.command(KIDBGLOG, *shlex.split(arguments))
-        ended = run(*command)
+        ended = run("timeout", "20", *command)
         return f"{ended.returncode} {ended.stdout}".strip()
 
     return run_kidbglog
@@ -111,6 +111,20 @@ def test_create_takes_a_larger_segment_and_opens_it_to_all(kidbglog):
     assert kidbglog("create") == "0"
     segments = run("ipcs", "--shmems").stdout
     assert re.search(r"0x18180004 .* 666 +3000 ", segments), segments
+
+
+def test_settings_that_cannot_be_used_are_named(kidbglog):
+    settings = Path("/var/packages/Camveld/etc/settings.conf")
+    kidbglog("create")
+    settings.unlink()
+    os.mkfifo(settings)
+    for command in "create", "load", "save":
+        refusal = f"1 kidbglog: {settings} is not a regular file"
+        assert kidbglog(command) == refusal
+    settings.unlink()
+    settings.parent.rmdir()
+    refusal = f"1 kidbglog: cannot write {settings}: No such file"
+    assert kidbglog("save").startswith(refusal)
 
 
 def test_only_a_process_gets_a_threshold(kidbglog):
