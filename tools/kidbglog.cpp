@@ -56,6 +56,15 @@ enum ExitStatus : int { REFUSED = 1, MISUSED = 2 };
   exit(Status);
 }
 
+void FinishOutput() {
+  if (fflush(stdout) != 0) {
+    Fail(REFUSED, "cannot write: %s", strerror(errno));
+  }
+  if (ferror(stdout) != 0) {
+    Fail(REFUSED, "cannot write: a part of the output is lost");
+  }
+}
+
 // --- Names ---
 
 // Returns how many insertions, deletions and replacements turn one text into the other.
@@ -394,9 +403,11 @@ int main(int argc, char* argv[]) {
         break;
       case 'h':
         fputs(USAGE, stdout);
+        FinishOutput();
         return 0;
       case 'V':
         puts("kidbglog " VERSION);
+        FinishOutput();
         return 0;
       default:  // getopt_long has printed the reason
         return MISUSED;
@@ -415,7 +426,5 @@ int main(int argc, char* argv[]) {
     Lock();
   }
   Command.pRun(Args);
-  if (fflush(stdout) != 0) {
-    Fail(REFUSED, "cannot write: %s", strerror(errno));
-  }
+  FinishOutput();
 }

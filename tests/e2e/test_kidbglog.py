@@ -6,6 +6,7 @@ import os
 import re
 import shlex
 import struct
+import subprocess
 import threading
 import time
 from pathlib import Path
@@ -138,6 +139,13 @@ def test_only_a_process_gets_a_threshold(kidbglog):
     stop.set()
     thread.join()
     assert "process" not in kidbglog("show")
+
+
+@pytest.mark.parametrize("command", ["--help", "--version"])
+def test_output_that_is_lost_is_a_failure(appliance, command):
+    words = appliance.command(KIDBGLOG, command)
+    with open("/dev/full", "w") as full:
+        assert subprocess.run(words, stdout=full).returncode == 1
 
 
 MESSAGES = [
