@@ -10,6 +10,7 @@
 #include <malloc.h>
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
@@ -514,35 +515,24 @@ static int UpgradeOnvifConfForContinuousPtzSpeed() {
 
 // --- The action tables ---
 
-// True if the thresholds ascend. Rows that always run (threshold 0) may be anywhere.
+// True if the thresholds ascend, every row but the last has an action, and {0, nullptr} is the
+// last. Rows that always run (threshold 0) may be anywhere.
 template <size_t Rows>
-static constexpr bool ThresholdsAscend(const UPD_LIST (&rgTable)[Rows]) {
+static constexpr bool IsActionTable(const UPD_LIST (&rgTable)[Rows]) {
   uint32_t Highest = 0;
   for (size_t Idx = 0; Idx + 1 < Rows; ++Idx) {
-    if (rgTable[Idx].orgVersion != 0 && rgTable[Idx].orgVersion < Highest) {
+    const UPD_LIST& Row = rgTable[Idx];
+    if (Row.orgVersion != 0 && Row.orgVersion < Highest) {
       return false;
     }
-    Highest = rgTable[Idx].orgVersion == 0 ? Highest : rgTable[Idx].orgVersion;
+    // Under UndefinedBehaviorSanitizer, GCC folds the comparison of null with null into a constant,
+    // but not that of a function with null.
+    if (__builtin_constant_p(Row.pFuncUpdate == nullptr) && Row.pFuncUpdate == nullptr) {
+      return false;
+    }
+    Highest = std::max(Highest, Row.orgVersion);
   }
-  return true;
-}
-
-template <size_t Rows>
-static constexpr bool EndsWithNull(const UPD_LIST (&rgTable)[Rows]) {
   return rgTable[Rows - 1].orgVersion == 0 && rgTable[Rows - 1].pFuncUpdate == nullptr;
-}
-
-// Under UndefinedBehaviorSanitizer, GCC does not fold the comparison of a function with null into a
-// constant, but it does fold the comparison of null with null.
-template <size_t Rows>
-static constexpr bool AllHaveActions(const UPD_LIST (&rgTable)[Rows]) {
-  for (size_t Idx = 0; Idx + 1 < Rows; ++Idx) {
-    if (__builtin_constant_p(rgTable[Idx].pFuncUpdate == nullptr) &&
-        rgTable[Idx].pFuncUpdate == nullptr) {
-      return false;
-    }
-  }
-  return true;
 }
 
 static constexpr UPD_LIST grgCamveldDBUpgradeAction[] = {
@@ -579,32 +569,23 @@ static constexpr UPD_LIST grgCamveldDBUpgradeAction[] = {
     {2475, UpdateReolinkRLC411And423Series},
     {0, nullptr},
 };
-static_assert(ThresholdsAscend(grgCamveldDBUpgradeAction),
-              "list the actions by ascending threshold");
-static_assert(EndsWithNull(grgCamveldDBUpgradeAction),
-              "the last row of an action table is {0, nullptr}");
-static_assert(AllHaveActions(grgCamveldDBUpgradeAction),
-              "only the last row of an action table has no action");
+static_assert(IsActionTable(grgCamveldDBUpgradeAction),
+              "list the actions by ascending threshold, then {0, nullptr}");
 
 static constexpr UPD_LIST grgCamveldRemoteCapUpgradeAction[] = {
     {68, UpgradeOnvifConfForPtzContinuousMove},
     {80, UpgradeOnvifConfForContinuousPtzSpeed},
     {0, nullptr},
 };
-static_assert(ThresholdsAscend(grgCamveldRemoteCapUpgradeAction),
-              "list the actions by ascending threshold");
-static_assert(EndsWithNull(grgCamveldRemoteCapUpgradeAction),
-              "the last row of an action table is {0, nullptr}");
-static_assert(AllHaveActions(grgCamveldRemoteCapUpgradeAction),
-              "only the last row of an action table has no action");
+static_assert(IsActionTable(grgCamveldRemoteCapUpgradeAction),
+              "list the actions by ascending threshold, then {0, nullptr}");
 
 static int DoAction(const UPD_LIST* pAction, uint32_t orgVer, int Idx) {
   const UPD_LIST& Row = pAction[Idx];
   if (Row.orgVersion != 0 && orgVer >= Row.orgVersion) {
     return 0;
   }
-  const int Err = Row.pFuncUpdate();
-  return Err;
+  return Row.pFuncUpdate();
 }
 
 // Runs the selected actions in order. A failed action does not stop the later ones. Returns -1 if
