@@ -143,6 +143,9 @@ DBConnect* ZAMODBConnect(const char* /*szHost*/, const char* /*szUser*/, const c
     ReportFailure(pConn->m_pDb, szDBName, "the file cannot be written");
     return nullptr;
   }
+  // A text may contain what a camera's row says. Without ATTACH and VACUUM INTO, which both attach
+  // a database, it reaches no other file.
+  sqlite3_limit(pConn->m_pDb, SQLITE_LIMIT_ATTACHED, 0);
   // Do not wait for a lock here, and ignore a failure: the text runs without these settings too.
   sqlite3_exec(pConn->m_pDb, CACHE_SETTINGS, nullptr, nullptr, nullptr);
   sqlite3_busy_timeout(pConn->m_pDb, BUSY_TIMEOUT_MSEC);

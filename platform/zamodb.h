@@ -20,7 +20,8 @@ DBConnect* ZAMODBConnect(const char* szHost, const char* szUser, const char* szP
 
 // Runs the statements of szSqlCmd in order and stops at the first failure. Waits up to five seconds
 // for a lock that another process holds. Returns 0, or -1 on failure. A text that leaves a
-// transaction open is a failure too. Every failure rolls back an open transaction.
+// transaction open is a failure too. So is one that uses another database (ATTACH, VACUUM INTO).
+// Every failure rolls back an open transaction.
 //
 // On success, if ppResult is not null, *ppResult receives the result set of the last statement that
 // returns columns, even if it has no rows, or null if no statement returns columns. The caller

@@ -5,9 +5,10 @@ import os
 import re
 import shlex
 import shutil
+import socket
 import sqlite3
 import subprocess
-from contextlib import closing, contextmanager
+from contextlib import closing, contextmanager, suppress
 from dataclasses import dataclass
 from pathlib import Path
 from subprocess import PIPE, STDOUT
@@ -211,3 +212,24 @@ def example(appliance):
     """The appliance of examples/: old cameras and some capability files."""
     appliance.load_example()
     return appliance
+
+
+@pytest.fixture
+def syslog():
+    """A function that returns the records since its last call.
+
+    More than ten unread records stall their sender.
+    """
+    with socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM) as log:
+        log.bind("/dev/log")
+        log.setblocking(False)
+
+        def records():
+            found = []
+            with suppress(BlockingIOError):
+                while True:
+                    found.append(log.recv(65536).decode())
+            return found
+
+        yield records
+    os.unlink("/dev/log")

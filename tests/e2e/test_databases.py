@@ -37,3 +37,17 @@ def test_an_action_waits_some_seconds_for_the_recorder(
         timer.cancel()
         timer.join()
     assert ended.returncode == status
+
+
+@pytest.mark.parametrize("escape", ["ATTACH {} AS o", "VACUUM INTO {}"])
+def test_a_value_reaches_no_other_file(example, syslog, escape):
+    outside = example.directory / "outside"
+    outside.touch()
+    # UpdateAxisA8105E writes this value between quotes as it is.
+    escape = escape.format(f"'{outside}'") + "; CREATE TABLE o.t (n)"
+    value = f"..'; COMMIT; {escape}; BEGIN; --".replace("'", "''")
+    wired = f"SET connected_wire = '{value}' WHERE model = 'A8105-E'"
+    example.sql(f"UPDATE camera {wired}")
+    assert example.upgrade(2400).status == 255
+    assert outside.read_bytes() == b""
+    assert "too many attached databases" in "".join(syslog())
