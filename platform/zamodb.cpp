@@ -4,6 +4,8 @@
 #include <sys/stat.h>
 #include <syslog.h>
 
+#include <cerrno>
+#include <cstring>
 #include <memory>
 #include <new>
 #include <optional>
@@ -49,9 +51,16 @@ struct StatementFinalizer {
 };
 using Statement = std::unique_ptr<sqlite3_stmt, StatementFinalizer>;
 
-bool IsRegularFile(const char* szPath) {
+// Null if szPath leads to a regular file, else the reason.
+const char* WhyNoRegularFile(const char* szPath) {
   struct stat Stat;
-  return stat(szPath, &Stat) == 0 && S_ISREG(Stat.st_mode);
+  if (stat(szPath, &Stat) != 0) {
+    return strerror(errno);
+  }
+  if (S_ISREG(Stat.st_mode)) {
+    return nullptr;
+  }
+  return S_ISDIR(Stat.st_mode) ? strerror(EISDIR) : "Not a regular file";
 }
 
 void ReportFailure(sqlite3* pDb, const char* szDBName, const char* szReason) {
@@ -129,7 +138,11 @@ int RunText(sqlite3* pDb, const char* szSqlCmd, std::unique_ptr<DBResult>* ppRes
 DBConnect* ZAMODBConnect(const char* /*szHost*/, const char* /*szUser*/, const char* /*szPassword*/,
                          const char* szDBName) {
   // SQLite would open a temporary database for an empty name and one in memory for ":memory:".
-  if (szDBName == nullptr || !IsRegularFile(szDBName)) {
+  if (szDBName == nullptr) {
+    return nullptr;
+  }
+  if (const char* szReason = WhyNoRegularFile(szDBName)) {
+    syslog(LOG_ERR, "zamodb: [%s]: %s", szDBName, szReason);
     return nullptr;
   }
   static const bool blConfigured = ConfigureSqlite();

@@ -1,7 +1,7 @@
 // Connections, statements and result sets of the package's SQLite databases.
 //
-// Only one thread at a time may use a connection or a result set. If SQLite gives a reason for a
-// failure, the reason and the database's name go to syslog at LOG_ERR.
+// Only one thread at a time may use a connection or a result set. The reason for a failure and the
+// database's name go to syslog at LOG_ERR.
 #pragma once
 
 struct DBConnect_tag;

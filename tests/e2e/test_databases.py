@@ -1,5 +1,6 @@
 """Databases that a customer's appliance may have."""
 
+import os
 import sqlite3
 from contextlib import closing
 from threading import Timer
@@ -7,6 +8,23 @@ from threading import Timer
 import pytest
 from conftest import TOOL, run
 from test_migrations import tables
+
+ABSENT = [
+    # what is in place of the database, the reason that syslog has
+    (lambda path: None, "No such file or directory"),
+    (lambda path: path.mkdir(), "Is a directory"),
+    (lambda path: path.symlink_to(path), "Too many levels of symbolic links"),
+    (os.mkfifo, "Not a regular file"),
+]
+
+
+@pytest.mark.parametrize("make, reason", ABSENT)
+def test_without_a_database_syslog_says_why(appliance, syslog, make, reason):
+    last = max(threshold for threshold, _ in tables()[0])
+    make(appliance.database)
+    assert appliance.upgrade(last - 1).status == 255
+    assert reason in "".join(syslog())
+
 
 DAMAGE = [
     lambda image: b"",
