@@ -39,9 +39,15 @@ constexpr int BUSY_TIMEOUT_MSEC = 5000;
 // for temporary files must then exist.
 constexpr int STATEMENT_JOURNAL_BYTES = 31 * 4096;
 
-// In KiB. Pages that were only read get little memory, so that it fits into the processor's cache.
-// Changed pages get SQLite's usual amount, because each write before the commit costs another sync.
-constexpr const char* CACHE_SETTINGS = "PRAGMA cache_size = -128; PRAGMA cache_spill = -2000";
+// The settings of each connection.
+constexpr const char* SETTINGS =
+    // What has ended outlasts a power cut, whatever this SQLite was built to do. EXTRA also syncs
+    // the removal of the rollback journal, which ends a transaction.
+    "PRAGMA synchronous = EXTRA;"
+    // In KiB. Pages that were only read get little memory, so that it fits into the processor's
+    // cache. Changed pages get SQLite's usual amount, because each write before the commit costs
+    // another sync.
+    "PRAGMA cache_size = -128; PRAGMA cache_spill = -2000";
 
 struct StatementFinalizer {
   void operator()(sqlite3_stmt* pStatement) const {
@@ -114,6 +120,7 @@ int RunStatement(sqlite3_stmt* pStatement, std::unique_ptr<DBResult>* ppResult) 
   return Step == SQLITE_DONE ? SQLITE_OK : Step;
 }
 
+// Runs all statements of a text, up to the first that fails.
 int RunText(sqlite3* pDb, const char* szSqlCmd, std::unique_ptr<DBResult>* ppResult) {
   while (*szSqlCmd != '\0') {
     sqlite3_stmt* pPrepared = nullptr;
@@ -159,8 +166,6 @@ DBConnect* ZAMODBConnect(const char* /*szHost*/, const char* /*szUser*/, const c
   // A text may contain what a camera's row says. Without ATTACH and VACUUM INTO, which both attach
   // a database, it reaches no other file.
   sqlite3_limit(pConn->m_pDb, SQLITE_LIMIT_ATTACHED, 0);
-  // Do not wait for a lock here, and ignore a failure: the text runs without these settings too.
-  sqlite3_exec(pConn->m_pDb, CACHE_SETTINGS, nullptr, nullptr, nullptr);
   sqlite3_busy_timeout(pConn->m_pDb, BUSY_TIMEOUT_MSEC);
   return pConn.release();
 }
@@ -172,7 +177,11 @@ int ZAMODBExecute(DBConnect* pConn, const char* szSqlCmd, DBResult** ppResult) {
   sqlite3* pDb = pConn->m_pDb;
   std::unique_ptr<DBResult> pResult;
   const char* szReason = nullptr;
-  const int Run = RunText(pDb, szSqlCmd, &pResult);
+  // The settings need the schema: if another process holds a lock, they wait as the text does.
+  int Run = RunText(pDb, SETTINGS, &pResult);
+  if (Run == SQLITE_OK) {
+    Run = RunText(pDb, szSqlCmd, &pResult);
+  }
   if (Run != SQLITE_OK) {
     // This layer may itself run out of memory, which SQLite's message would not show.
     szReason = Run == SQLITE_NOMEM ? sqlite3_errstr(Run) : sqlite3_errmsg(pDb);

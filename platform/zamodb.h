@@ -19,9 +19,10 @@ DBConnect* ZAMODBConnect(const char* szHost, const char* szUser, const char* szP
                          const char* szDBName);
 
 // Runs the statements of szSqlCmd in order and stops at the first failure. Waits up to five seconds
-// for a lock that another process holds. Returns 0, or -1 on failure. A text that leaves a
+// for each lock that another process holds. Returns 0, or -1 on failure. A text that leaves a
 // transaction open is a failure too. So is one that uses another database (ATTACH, VACUUM INTO).
-// Every failure rolls back an open transaction.
+// Every failure rolls back an open transaction. After success, what the text has committed is on
+// stable storage.
 //
 // On success, if ppResult is not null, *ppResult receives the result set of the last statement that
 // returns columns, even if it has no rows, or null if no statement returns columns. The caller

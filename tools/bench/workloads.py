@@ -24,6 +24,7 @@ CAPS = DATABASE.parent / "@camveld/@KICapInfo"
 FILES = Path("/var/files")
 RESULT = Path("/var/result")  # of a program that measures another
 
+SYNC = "PRAGMA synchronous = EXTRA"  # what the tool promises, too
 UPGRADE = [TOOL, "0"]
 PREVIEW = [BUILD / "preview/tessel-preview", "--tool", TOOL, DATABASE, "0"]
 UPDATE_FILES = [TOOL, "--updateCap", FILES]
@@ -119,7 +120,7 @@ def upgrade(count, rounds):
     script = [f'sqlite3 {DATABASE} "{change}"' for change in changes]
     ways = {
         "ours": UPGRADE,
-        "one sqlite3": ["sqlite3", DATABASE, *changes],
+        "one sqlite3": ["sqlite3", DATABASE, SYNC, *changes],
         "script": ["sh", "-ec", "\n".join(script)],
     }
     make_cameras(count)
