@@ -6,7 +6,7 @@ from contextlib import closing
 from threading import Timer
 
 import pytest
-from conftest import TOOL, run
+from conftest import STRACE, TOOL, run
 from test_migrations import tables
 
 ABSENT = [
@@ -69,3 +69,15 @@ def test_a_value_reaches_no_other_file(example, syslog, escape):
     assert example.upgrade(2400).status == 255
     assert outside.read_bytes() == b""
     assert "too many attached databases" in "".join(syslog())
+
+
+def test_many_cameras_need_no_temporary_file(example, tmp_path):
+    # UpdateDAHUASD4XC212S changes these cameras twice in one transaction.
+    example.sql(
+        "INSERT INTO camera (vendor, model, resolution, rec_bitrate_ctrl) "
+        "SELECT 'DAHUA', 'SD40212S-HN', '640x480', 2 FROM camera, camera"
+    )
+    trace = tmp_path / "trace"
+    under = [*STRACE, "-o", trace, "-e", "openat"]
+    assert example.upgrade(563, under=under).status == 0
+    assert trace.read_text().count("/etilqs_") == 0
