@@ -1,13 +1,20 @@
 #include "kidb.h"
 
 #include <map>
+#include <memory>
 #include <mutex>
 
+#include "fileops.h"
 #include "kidebuglog.h"
 
 namespace {
 
 std::mutex gDBMutex[KiDB::DBI_CNT];
+
+struct ConnectionCloser {
+  void operator()(DBConnect* pConn) const { ZAMODBClose(pConn); }
+};
+using Connection = std::unique_ptr<DBConnect, ConnectionCloser>;
 
 }  // namespace
 
@@ -48,9 +55,9 @@ static void ReplaceBoolForSqlite(std::string& strCmd) {
   }
 }
 
-static DBConnect* KiDBConnect(const std::string& strDBName) {
+static Connection KiDBConnect(const std::string& strDBName) {
   // The user name is ignored, but callers always pass this one.
-  return ZAMODBConnect(nullptr, "postgres", nullptr, strDBName.c_str());
+  return Connection(ZAMODBConnect(nullptr, "postgres", nullptr, strDBName.c_str()));
 }
 
 int Execute(DB_INSTANCE DBInstance, std::string strCommand, DBResult_tag** ppResult,
@@ -62,30 +69,22 @@ int Execute(DB_INSTANCE DBInstance, std::string strCommand, DBResult_tag** ppRes
     ReplaceBoolForSqlite(strCommand);
   }
 
+  // Were the thread cancelled in SQLite, the database would stay locked.
+  const fileops::NoCancel Guard;
   const std::lock_guard<std::mutex> Lock(gDBMutex[MutexIdx]);
-  DBConnect* pConn = KiDBConnect(strDBName);
+  const Connection pConn = KiDBConnect(strDBName);
   if (pConn == nullptr) {
     KiPrintf(KI_LOG, nullptr, nullptr, __FILE__, __LINE__, __func__,
              "Failed to connect to db[%d, %s].\n", DBInstance, strDBName.c_str());
     return -1;
   }
-  int Ret = 0;
-  DBResult* pCurrResult = nullptr;
   strCommand = "BEGIN;" + strCommand + ";COMMIT;";
-  if (ZAMODBExecute(pConn, strCommand.c_str(), &pCurrResult) != 0) {
+  if (ZAMODBExecute(pConn.get(), strCommand.c_str(), ppResult) != 0) {
     KiPrintf(KI_LOG, nullptr, nullptr, __FILE__, __LINE__, __func__,
              "Failed to execute db[%d] cmd: %s.\n", DBInstance, strCommand.c_str());
-    Ret = -1;
+    return -1;
   }
-  if (pCurrResult != nullptr) {
-    if (Ret == 0 && ppResult != nullptr) {
-      *ppResult = pCurrResult;
-    } else {
-      ZAMODBFreeResult(pCurrResult);
-    }
-  }
-  ZAMODBClose(pConn);
-  return Ret;
+  return 0;
 }
 
 void KiDBFreeResult(DBResult_tag* pResult) { ZAMODBFreeResult(pResult); }

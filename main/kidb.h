@@ -22,7 +22,9 @@ typedef enum __DB_INSTANCE : int {
 // before the call. If blReplaceBoolForSqlite is true, every "true", "TRUE", "false" and "FALSE" in
 // strCommand, even inside names and quotes, is replaced by 1 or 0.
 //
-// Any thread may call it. Calls for the same database run one after another.
+// Any thread may call it. Calls for the same database run one after another. A request to cancel
+// the thread waits until the call ends. If memory runs out, std::bad_alloc may leave the call;
+// nothing is then committed that is not whole, and nothing stays open.
 int Execute(DB_INSTANCE DBInstance, std::string strCommand, DBResult_tag** ppResult,
             bool blReplaceBoolForSqlite);
 

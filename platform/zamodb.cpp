@@ -190,7 +190,7 @@ int ZAMODBExecute(DBConnect* pConn, const char* szSqlCmd, DBResult** ppResult) {
     }
     return -1;
   }
-  if (ppResult != nullptr) {
+  if (ppResult != nullptr && pResult != nullptr) {
     *ppResult = pResult.release();
   }
   return 0;

@@ -25,9 +25,9 @@ DBConnect* ZAMODBConnect(const char* szHost, const char* szUser, const char* szP
 // stable storage.
 //
 // On success, if ppResult is not null, *ppResult receives the result set of the last statement that
-// returns columns, even if it has no rows, or null if no statement returns columns. The caller
-// releases it with ZAMODBFreeResult. It holds copies and outlives the connection. On failure
-// *ppResult is unchanged.
+// returns columns, even if it has no rows. The caller releases it with ZAMODBFreeResult. It holds
+// copies and outlives the connection. On failure, or if no statement returns columns, *ppResult is
+// unchanged.
 int ZAMODBExecute(DBConnect* pConn, const char* szSqlCmd, DBResult** ppResult);
 
 // Number of rows; 0 for null.
