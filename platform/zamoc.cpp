@@ -82,6 +82,9 @@ int ReadAll(int Fd, size_t Size, std::string* pText) {
   pText->resize(Size + 1);  // one more byte, so that one read shows the end too
   for (;;) {
     const ssize_t Count = read(Fd, pText->data() + Len, pText->size() - Len);
+    if (Count == -1 && errno == EINTR) {
+      continue;
+    }
     if (Count == -1) {
       return -1;
     }

@@ -46,12 +46,20 @@ def test_a_directory_of_strange_files(appliance):
     assert sorted(os.listdir(caps)) == entries
 
 
-# EINVAL says that the file system cannot sync directories.
-@pytest.mark.parametrize("error, emptied", [("EINVAL", 2), ("EIO", 1)])
-def test_a_failed_sync_of_the_directory_ends_it(appliance, error, emptied):
+DISTURBED = [
+    # the call that fails once, its error, how many of two files change
+    ("read", "EINTR", 2),
+    ("fsync", "EINVAL", 2),  # this file system cannot sync directories
+    ("fsync", "EIO", 1),
+]
+
+
+@pytest.mark.parametrize("call, error, changed", DISTURBED)
+def test_what_a_failed_call_costs(appliance, call, error, changed):
     for name in "ab":
         appliance.capability_file(name, f"{MARKER}=yes\n")
-    under = [*STRACE, "-P", CAPS, "-e", f"inject=fsync:error={error}"]
+    inject = f"inject={call}:error={error}:when=1"
+    under = [*STRACE, "-P", CAPS, "-P", f"{CAPS}/a", "-e", inject]
     result = appliance.upgrade("--updateCap", CAPS, under=under)
-    assert result.status == (0 if emptied == 2 else 255)
-    assert list(appliance.capability_files().values()).count("") == emptied
+    assert result.status == (0 if changed == 2 else 255)
+    assert list(appliance.capability_files().values()).count("") == changed
