@@ -12,6 +12,7 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "caplines.h"
@@ -149,12 +150,12 @@ int ReplaceFile(const std::string& strFile, const std::string& strDir, int DirFd
     return ReportFailure(strFile, Result);
   }
   strText = ChangeLines(strText, Changes);
-  const std::string strNew = strDir + TMP_NAME;
+  std::string strNew = strDir + TMP_NAME;
   const fileops::Descriptor New(fileops::CreateAnew(strNew.c_str()));
   if (New.Get() == -1) {
     return ReportFailure(strFile, "creation of a temporary file");
   }
-  fileops::TmpFile NewName(strNew);
+  fileops::TmpFile NewName(std::move(strNew));  // a copy could fail and leave the file behind
   if (fileops::WriteAll(New.Get(), strText.data(), strText.size()) != 0) {
     return ReportFailure(strFile, "copy");
   }
