@@ -34,9 +34,10 @@ constexpr const char* TMP_NAME = "/.zamoc.tmp";
 
 enum class ReadResult {
   Read,
-  NoCapabilityFile,  // the file cannot be a capability file; no failure
-  OpenFailed,
-  ReadFailed,
+  NoCapabilityFile,  // missing, a loop of links, or of another kind; no failure
+  TooLarge,
+  OpenFailed,  // with errno
+  ReadFailed,  // with errno
 };
 
 // True for a temporary file of this library, which is never a capability file. A killed process may
@@ -47,38 +48,21 @@ bool IsTmpFile(const std::string& strFile) {
          strFile.compare(strFile.size() - strEnd.size(), strEnd.size(), strEnd) == 0;
 }
 
-// Returns 0 if the file can be a capability file, else -1 with errno.
-int CheckFile(const struct stat& Stat) {
+// Read if the file can be read.
+ReadResult CheckFile(const struct stat& Stat) {
   if (!S_ISREG(Stat.st_mode)) {
-    errno = EINVAL;
-    return -1;
+    return ReadResult::NoCapabilityFile;
   }
-  if (Stat.st_size > static_cast<off_t>(MAX_FILE_SIZE)) {
-    errno = EFBIG;
-    return -1;
-  }
-  return 0;
+  return Stat.st_size > static_cast<off_t>(MAX_FILE_SIZE) ? ReadResult::TooLarge : ReadResult::Read;
 }
 
-// Checks the file before opening it, because opening a FIFO could hang and opening a device could
-// have side effects. Returns a descriptor and sets *pSize to the file's size, or returns -1 with
-// errno.
-int OpenCapabilityFile(const std::string& strFile, size_t* pSize) {
-  if (IsTmpFile(strFile)) {
-    errno = EINVAL;
-    return -1;
-  }
-  struct stat Stat;
-  if (stat(strFile.c_str(), &Stat) != 0 || CheckFile(Stat) != 0) {
-    return -1;
-  }
-  *pSize = static_cast<size_t>(Stat.st_size);
-  return open(strFile.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
+// The result of a stat or an open that failed.
+ReadResult NotOpened() {
+  return errno == ENOENT || errno == ELOOP ? ReadResult::NoCapabilityFile : ReadResult::OpenFailed;
 }
 
-// Reads a file to its end. Size is its expected size. Returns 0, or -1 with errno; a file that has
-// grown too large gives EFBIG.
-int ReadAll(int Fd, size_t Size, std::string* pText) {
+// Reads a file to its end. Size is its expected size.
+ReadResult ReadAll(int Fd, size_t Size, std::string* pText) {
   size_t Len = 0;
   pText->resize(Size + 1);  // one more byte, so that one read shows the end too
   for (;;) {
@@ -87,16 +71,15 @@ int ReadAll(int Fd, size_t Size, std::string* pText) {
       continue;
     }
     if (Count == -1) {
-      return -1;
+      return ReadResult::ReadFailed;
     }
     Len += static_cast<size_t>(Count);
     if (Len > MAX_FILE_SIZE) {
-      errno = EFBIG;
-      return -1;
+      return ReadResult::TooLarge;
     }
     if (Count == 0 || Len == Size) {
       pText->resize(Len);
-      return 0;
+      return ReadResult::Read;
     }
     if (Len == pText->size()) {
       pText->resize(2 * Len);
@@ -104,20 +87,37 @@ int ReadAll(int Fd, size_t Size, std::string* pText) {
   }
 }
 
-// Reads the text of a capability file and, if pStat is not null, the status of the opened file. If
-// the result is not Read, errno gives the reason, and the text is not usable.
+// Reads the text of a capability file and, if pStat is not null, the status of the opened file.
+// Unless the result is Read, the text is not usable.
 ReadResult ReadFile(const std::string& strFile, std::string* pText, struct stat* pStat) {
-  size_t Size = 0;
-  const fileops::Descriptor File(OpenCapabilityFile(strFile, &Size));
-  if (File.Get() == -1 ||
-      (pStat != nullptr && (fstat(File.Get(), pStat) != 0 || CheckFile(*pStat) != 0))) {
-    const bool blByName = errno == EINVAL || errno == EFBIG || errno == ENOENT || errno == ELOOP;
-    return blByName ? ReadResult::NoCapabilityFile : ReadResult::OpenFailed;
+  if (IsTmpFile(strFile)) {
+    return ReadResult::NoCapabilityFile;
   }
-  if (ReadAll(File.Get(), Size, pText) != 0) {
-    return ReadResult::ReadFailed;
+  // Check the file before opening it: to open a FIFO could hang, and to open a device could have
+  // side effects.
+  struct stat Named;
+  if (stat(strFile.c_str(), &Named) != 0) {
+    return NotOpened();
   }
-  return ReadResult::Read;
+  ReadResult Result = CheckFile(Named);
+  if (Result != ReadResult::Read) {
+    return Result;
+  }
+  const fileops::Descriptor File(
+      open(strFile.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+  if (File.Get() == -1) {
+    return NotOpened();
+  }
+  if (pStat != nullptr) {
+    if (fstat(File.Get(), pStat) != 0) {
+      return ReadResult::OpenFailed;
+    }
+    Result = CheckFile(*pStat);
+    if (Result != ReadResult::Read) {
+      return Result;
+    }
+  }
+  return ReadAll(File.Get(), static_cast<size_t>(Named.st_size), pText);
 }
 
 int ReportFailure(const std::string& strFile, const char* szStep) {
@@ -127,7 +127,20 @@ int ReportFailure(const std::string& strFile, const char* szStep) {
 }
 
 int ReportFailure(const std::string& strFile, ReadResult Result) {
-  return ReportFailure(strFile, Result == ReadResult::ReadFailed ? "read" : "open");
+  switch (Result) {
+    case ReadResult::OpenFailed:
+      return ReportFailure(strFile, "open");
+    case ReadResult::ReadFailed:
+      return ReportFailure(strFile, "read");
+    case ReadResult::TooLarge:
+      syslog(LOG_ERR, "zamoc: [%s]: larger than 16 MiB", strFile.c_str());
+      return -1;
+    case ReadResult::Read:
+    case ReadResult::NoCapabilityFile:
+      break;
+  }
+  syslog(LOG_ERR, "zamoc: [%s]: no capability file", strFile.c_str());
+  return -1;
 }
 
 // --- Changes ---

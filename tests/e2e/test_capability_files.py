@@ -17,7 +17,7 @@ def test_only_the_removal_of_the_marker_has_to_work(appliance, marker, status):
     assert file.read_text() == "pan=yes\n" + marker
 
 
-def test_a_directory_of_strange_files(appliance):
+def test_a_directory_of_strange_files(appliance, syslog):
     # The tool uses 511 bytes of its argument.
     caps = appliance.directory / ("d" * 240) / "e"
     argument = f"/var/packages/Camveld/target/{caps.parent.name}/"
@@ -34,12 +34,16 @@ def test_a_directory_of_strange_files(appliance):
     os.mkfifo(caps / "fifo")
     binary = bytes(range(11, 256)) * 400 + b"\n"
     (caps / "binary").write_bytes(binary + b"pan=yes\n")
+    (caps / "large").write_text("pan=yes\n")
+    os.truncate(caps / "large", 2**24 + 1)
     entries = sorted(os.listdir(caps))
 
     argument += caps.name + "behind"
     assert appliance.upgrade("--updateCap", argument).status == 0
     for file in files:
         assert file.read_text() == "pan= step\n", file
+    assert (caps / "large").stat().st_size == 2**24 + 1
+    assert "/large]: larger than 16 MiB" in "".join(syslog())
     assert (caps / "a").stat().st_mode & 0o777 == 0o400
     assert (caps / "binary").read_bytes() == binary + b"pan= step\n"
     assert (caps / "link").is_symlink()
