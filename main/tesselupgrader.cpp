@@ -18,7 +18,6 @@
 #include <initializer_list>
 #include <memory>
 #include <string>
-#include <vector>
 
 #include "fileops.h"
 #include "kidb.h"
@@ -435,12 +434,11 @@ static int UpdateReolinkRLC411And423Series() {
 
 // --- Capability files ---
 
-// The value of strKey; empty if the key or the file is missing or the file cannot be read.
-static std::string GetConfKeyValue(const std::string& strFilePath, const std::string& strKey) {
-  char szValue[512] = "";
-  const int Len =
-      ZAMOCFileGetKeyValue(strFilePath.c_str(), strKey.c_str(), szValue, sizeof(szValue), 0);
-  return Len > 0 ? szValue : "";
+// The value of strKey, at most 511 bytes of it; empty if the file has no such key.
+static std::string GetConfKeyValue(const ZAMOCFile& File, const std::string& strKey) {
+  char szValue[512];
+  snprintf(szValue, sizeof(szValue), "%s", File.Get(strKey).c_str());
+  return szValue;
 }
 
 struct DirCloser {
@@ -453,7 +451,7 @@ struct DirCloser {
 // Calls pUpgradeFile for every entry of the capability directory, of any type and name, until a
 // call fails. Returns -1 if a call failed or if there is no capability directory. A directory that
 // cannot be opened counts as empty; a read error counts as its end.
-static int ForEachCapFile(int (*pUpgradeFile)(const std::string& strFilePath)) {
+static int ForEachCapFile(int (*pUpgradeFile)(ZAMOCFile& File)) {
   if (gstrRemoteCapDir.empty()) {
     return -1;
   }
@@ -468,47 +466,43 @@ static int ForEachCapFile(int (*pUpgradeFile)(const std::string& strFilePath)) {
     if (strName == "." || strName == "..") {
       continue;
     }
-    if (pUpgradeFile(szCapPath + ("/" + strName)) != 0) {
+    ZAMOCFile File(szCapPath + ("/" + strName));
+    if (pUpgradeFile(File) != 0) {
       return -1;
     }
   }
   return 0;
 }
 
-// Makes all changes of a file in one replacement. If only the removal of the marker were done, the
-// next run would turn a continuous axis into a stepping one.
+// Saves all changes of a file together. If only the removal of the marker were done, the next run
+// would turn a continuous axis into a stepping one.
 static int UpgradeOnvifConfForPtzContinuousMove() {
-  return ForEachCapFile([](const std::string& strFilePath) {
-    const ZAMOCReading Reading(strFilePath);
-    std::vector<ZAMOCKeyChange> Changes;
-    const bool blPtzContinuousMove = GetConfKeyValue(strFilePath, "ptz_continuous_move") == "yes";
+  return ForEachCapFile([](ZAMOCFile& File) {
+    const bool blPtzContinuousMove = GetConfKeyValue(File, "ptz_continuous_move") == "yes";
     if (blPtzContinuousMove) {
-      Changes.push_back({"ptz_continuous_move", nullptr, nullptr});
+      File.Remove("ptz_continuous_move");
     }
     for (const char* szAxis : {"pan", "tilt", "zoom"}) {
-      if (GetConfKeyValue(strFilePath, szAxis) == "yes") {
-        Changes.push_back({szAxis, blPtzContinuousMove ? "continuous" : "step", "%s= %s\n"});
+      if (GetConfKeyValue(File, szAxis) == "yes") {
+        File.Set(szAxis, blPtzContinuousMove ? "continuous" : "step", "%s= %s\n");
       }
     }
-    if (Changes.empty()) {
-      return 0;
-    }
-    const int Err = ZAMOCFileChangeKeys(strFilePath.c_str(), Changes.data(), Changes.size());
+    const int Err = File.Save();
     return blPtzContinuousMove ? Err : 0;  // only the removal of the marker must succeed
   });
 }
 
 static int UpgradeOnvifConfForContinuousPtzSpeed() {
-  return ForEachCapFile([](const std::string& strFilePath) {
-    const ZAMOCReading Reading(strFilePath);
-    if (!GetConfKeyValue(strFilePath, "ptz_speed_max").empty()) {
+  return ForEachCapFile([](ZAMOCFile& File) {
+    if (!GetConfKeyValue(File, "ptz_speed_max").empty()) {
       return 0;
     }
-    const bool blSupportPtzSpeed = GetConfKeyValue(strFilePath, "pan") == "continuous" ||
-                                   GetConfKeyValue(strFilePath, "tilt") == "continuous";
+    const bool blSupportPtzSpeed = GetConfKeyValue(File, "pan") == "continuous" ||
+                                   GetConfKeyValue(File, "tilt") == "continuous";
     if (blSupportPtzSpeed) {
-      ZAMOCFileSetKeyValue(strFilePath.c_str(), "ptz_speed_max", "1", "%s = %s\n");
+      File.Set("ptz_speed_max", "1", "%s = %s\n");
     }
+    File.Save();
     return 0;
   });
 }

@@ -188,123 +188,83 @@ int ReplaceFile(const std::string& strFile, const std::string& strDir, int DirFd
   return 0;
 }
 
-bool IsLink(const char* szFile) {
+bool IsLink(const std::string& strFile) {
   struct stat Stat;
-  return lstat(szFile, &Stat) == 0 && S_ISLNK(Stat.st_mode);
+  return lstat(strFile.c_str(), &Stat) == 0 && S_ISLNK(Stat.st_mode);
 }
 
-int ChangeFile(const char* szFile, const std::vector<Change>& Changes) {
-  std::string strReal = szFile;
-  if (strReal.find('/') == std::string::npos || IsLink(szFile)) {
+int ChangeFile(const std::string& strFile, const std::vector<Change>& Changes) {
+  std::string strReal = strFile;
+  if (strReal.find('/') == std::string::npos || IsLink(strFile)) {
     // Keep a symbolic link and replace the file that it leads to.
-    const std::unique_ptr<char, decltype(&free)> pReal(realpath(szFile, nullptr), free);
+    const std::unique_ptr<char, decltype(&free)> pReal(realpath(strFile.c_str(), nullptr), free);
     if (pReal == nullptr) {
-      return ReportFailure(szFile, "realpath");
+      return ReportFailure(strFile, "realpath");
     }
     strReal = pReal.get();
   }
   const std::string strDir = strReal.substr(0, std::max<size_t>(strReal.rfind('/'), 1));
   const fileops::Descriptor Dir(open(strDir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (Dir.Get() == -1) {
-    return ReportFailure(szFile, "open of the directory");
+    return ReportFailure(strFile, "open of the directory");
   }
   // Concurrent changes must not undo each other.
   if (KiFlock::Lock(Dir.Get(), DIR_LOCK_TIMEOUT_SEC, true) != 0) {
-    return ReportFailure(szFile, "lock of the directory");
+    return ReportFailure(strFile, "lock of the directory");
   }
   return ReplaceFile(strReal, strDir, Dir.Get(), Changes);
 }
 
 }  // namespace
 
-thread_local const ZAMOCReading* ZAMOCReading::m_pInnermost = nullptr;
-
-ZAMOCReading::ZAMOCReading(const std::string& strFile)
-    : m_strFile(strFile), m_pOuter(m_pInnermost) {
+ZAMOCFile::ZAMOCFile(std::string strFile) : m_strFile(std::move(strFile)) {
   const ReadResult Result = ReadFile(m_strFile, &m_strText, nullptr);
   m_blRead = Result == ReadResult::Read;
   if (!m_blRead && Result != ReadResult::NoCapabilityFile) {
     ReportFailure(m_strFile, Result);
   }
-  m_pInnermost = this;
 }
 
-ZAMOCReading::~ZAMOCReading() { m_pInnermost = m_pOuter; }
+std::string ZAMOCFile::Get(const std::string& strKey) const {
+  std::string_view Value;
+  return m_blRead && FindKey(m_strText, strKey, &Value) ? std::string(Value) : "";
+}
 
-const ZAMOCReading* ZAMOCReading::Find(const char* szFile) {
-  const ZAMOCReading* pReading = m_pInnermost;
-  while (pReading != nullptr && pReading->m_strFile != szFile) {
-    pReading = pReading->m_pOuter;
+void ZAMOCFile::Set(const std::string& strKey, const std::string& strValue,
+                    const std::string& strFormat) {
+  const std::string strNewLine = FormatLine(strFormat, strKey, strValue);
+  m_blValid = m_blValid && !strNewLine.empty();
+  Note(strKey, strNewLine);
+}
+
+void ZAMOCFile::Remove(const std::string& strKey) { Note(strKey, ""); }
+
+void ZAMOCFile::Note(const std::string& strKey, const std::string& strNewLine) {
+  m_blValid = m_blValid && !strKey.empty();
+  for (Change& Noted : m_Changes) {
+    if (Noted.strKey == strKey) {
+      Noted.strNewLine = strNewLine;
+      return;
+    }
   }
-  return pReading;
+  m_Changes.push_back({strKey, strNewLine});
 }
 
-int ZAMOCReading::GetKeyValue(const char* szKey, char* szValue, size_t Size) const {
-  szValue[0] = '\0';
+int ZAMOCFile::Save() {
+  if (!m_blValid) {
+    errno = EINVAL;
+    return ReportFailure(m_strFile, "change of a key");
+  }
+  if (m_Changes.empty()) {
+    return 0;
+  }
   if (!m_blRead) {
-    return -1;
+    return ReportFailure(m_strFile, ReadResult::NoCapabilityFile);
   }
-  std::string_view Value;
-  if (!FindKey(m_strText, szKey, &Value)) {
+  if (ChangeLines(m_strText, m_Changes) == m_strText) {
     return 0;
   }
-  szValue[Value.copy(szValue, Size - 1)] = '\0';
-  return static_cast<int>(Value.size());
-}
-
-int ZAMOCFileGetKeyValue(const char* szFile, const char* szKey, char* szValue, size_t Size,
-                         int /*Flags*/) {
-  if (szFile == nullptr || szKey == nullptr || szValue == nullptr || Size == 0) {
-    return -1;
-  }
-  const ZAMOCReading* pReading = ZAMOCReading::Find(szFile);
-  if (pReading != nullptr) {
-    return pReading->GetKeyValue(szKey, szValue, Size);
-  }
-  return ZAMOCReading(szFile).GetKeyValue(szKey, szValue, Size);
-}
-
-int ZAMOCFileChangeKeys(const char* szFile, const ZAMOCKeyChange* pChanges, size_t Count) {
-  if (szFile == nullptr || pChanges == nullptr) {
-    return -1;
-  }
-  std::vector<Change> Changes;
-  for (const ZAMOCKeyChange* pChange = pChanges; pChange != pChanges + Count; ++pChange) {
-    Change New;
-    New.strKey = pChange->szKey == nullptr ? "" : pChange->szKey;
-    if (pChange->szValue != nullptr && pChange->szFormat != nullptr) {
-      New.strNewLine = FormatLine(pChange->szFormat, New.strKey, pChange->szValue);
-    }
-    if (New.strKey.empty() || New.strNewLine.empty() != (pChange->szValue == nullptr)) {
-      errno = EINVAL;
-      return ReportFailure(szFile, "change of a key");
-    }
-    Changes.push_back(New);
-  }
-  return ChangeFile(szFile, Changes);
-}
-
-int ZAMOCFileSetKeyValue(const char* szFile, const char* szKey, const char* szValue,
-                         const char* szFormat) {
-  const ZAMOCKeyChange Change = {szKey, szValue == nullptr ? "" : szValue, szFormat};
-  return ZAMOCFileChangeKeys(szFile, &Change, 1);
-}
-
-int ZAMOCFileRemoveKey(const char* szFile, const char* szKey) {
-  if (szFile == nullptr || szKey == nullptr) {
-    return -1;
-  }
-  std::string strText;
-  const ReadResult Result = ReadFile(szFile, &strText, nullptr);
-  if (Result != ReadResult::Read) {
-    return ReportFailure(szFile, Result);
-  }
-  std::string_view Value;
-  if (!FindKey(strText, szKey, &Value)) {
-    return 0;
-  }
-  const ZAMOCKeyChange Change = {szKey, nullptr, nullptr};
-  return ZAMOCFileChangeKeys(szFile, &Change, 1) == 0 ? 1 : -1;
+  return ChangeFile(m_strFile, m_Changes);
 }
 
 void ZAMOCCopyright() { puts(ZAMOC_BANNER); }

@@ -12,19 +12,21 @@
 static constexpr const char* NAME = "/var/file";
 
 static void FuzzCapabilityFile(const std::string& strText, const std::string& strVal) {
-  char szVal[16];
   WriteFile(NAME, strText);
-  const int Removed = ZAMOCFileRemoveKey(NAME, "k");
+  ZAMOCFile Old(NAME);
+  Old.Remove("k");
+  assert(Old.Save() == 0);
+  assert(ZAMOCFile(NAME).Get("k").empty());
   std::string strExpected = ReadFile(NAME);
-  assert(Removed == (strExpected == strText ? 0 : 1));
   strExpected += strExpected.empty() || strExpected.back() == '\n' ? "" : "\n";
   strExpected += "k=" + strVal + "\n";
   for (int Time = 0; Time < 2; ++Time) {
-    ZAMOCFileSetKeyValue(NAME, "k", strVal.c_str(), "%s=%s\n");
+    ZAMOCFile File(NAME);
+    File.Set("k", strVal, "%s=%s\n");
+    assert(File.Save() == 0);
     assert(ReadFile(NAME) == strExpected);
   }
-  ZAMOCFileGetKeyValue(NAME, "k", szVal, sizeof(szVal), 0);
-  assert(szVal == strVal);
+  assert(ZAMOCFile(NAME).Get("k") == strVal);
 }
 
 static void FuzzKeyValueFile(const std::string& strText, const std::string& strVal) {

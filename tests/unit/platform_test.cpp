@@ -15,15 +15,10 @@ constexpr const char* LEFT_BEHIND = "/var/services/camveld/.zamoc.tmp";
 class CapabilityFile : public PrivateVar {};
 class Database : public PrivateVar {};
 
-// The length of the value of k, and as much of it as a small buffer holds.
-std::string Get(const char* szFile) {
-  char szValue[8] = "old";
-  const int Len = ZAMOCFileGetKeyValue(szFile, "k", szValue, sizeof(szValue), 0);
-  return std::to_string(Len) + " " + szValue;
-}
-
 int Set(const char* szFile, const char* szValue) {
-  return ZAMOCFileSetKeyValue(szFile, "k", szValue, "%s= %s\n");
+  ZAMOCFile File(szFile);
+  File.Set("k", szValue, "%s= %s\n");
+  return File.Save();
 }
 
 TEST_F(CapabilityFile, LinesAreReadAndChanged) {
@@ -33,32 +28,54 @@ TEST_F(CapabilityFile, LinesAreReadAndChanged) {
     std::string strGot;
     std::string strAfter;  // k was set
   } rgCase[] = {
-      {"", "0 ", "k= new\n"},
-      {"a=1", "0 ", "a=1\nk= new\n"},
-      {strOthers, "0 ", strOthers + "k= new\n"},
-      {"a=1\nk=2\nb=3\nk=4\n\n k\t=5", "1 2", "a=1\nk= new\nb=3\n\n"},
-      {" k\t=\t v= w \t\r\nb=3", "4 v= w", "k= new\nb=3"},
-      {"k = \"a \"\r\n", "2 a ", "k= new\n"},
-      {"k=\"\"a\"\"", "3 \"a\"", "k= new\n"},
-      {"k=\"\n", "1 \"", "k= new\n"},
-      {"k=\"a\n", "2 \"a", "k= new\n"},
-      {"a=\0\nk=12345678\n"s, "8 1234567", "a=\0\nk= new\n"s},
+      {"", "", "k= new\n"},
+      {"a=1", "", "a=1\nk= new\n"},
+      {strOthers, "", strOthers + "k= new\n"},
+      {"a=1\nk=2\nb=3\nk=4\n\n k\t=5", "2", "a=1\nk= new\nb=3\n\n"},
+      {" k\t=\t v= w \t\r\nb=3", "v= w", "k= new\nb=3"},
+      {"k = \"a \"\r\n", "a ", "k= new\n"},
+      {"k=\"\"a\"\"", "\"a\"", "k= new\n"},
+      {"k=\"\n", "\"", "k= new\n"},
+      {"k=\"a\n", "\"a", "k= new\n"},
+      {"a=\0\nk=1\0002\n"s, "1\0002"s, "a=\0\nk= new\n"s},
   };
   for (const auto& Case : rgCase) {
     WriteFile(FILE_NAME, Case.strBefore);
-    EXPECT_EQ(Get(FILE_NAME), Case.strGot) << Case.strBefore;
+    EXPECT_EQ(ZAMOCFile(FILE_NAME).Get("k"), Case.strGot) << Case.strBefore;
     Set(FILE_NAME, "new");
     EXPECT_EQ(ReadFile(FILE_NAME), Case.strAfter);
   }
 }
 
-TEST_F(CapabilityFile, WhatIsNotOneLineOfTheKeyIsRefused) {
+TEST_F(CapabilityFile, AllChangesAreMadeOrNone) {
   WriteFile(FILE_NAME, "k=1\n");
   for (const char* szFormat : {"%s=\n", "%s=%s%n\n", "%s=%s", "#%s=%s\n"}) {
-    EXPECT_EQ(ZAMOCFileSetKeyValue(FILE_NAME, "k", "v", szFormat), -1) << szFormat;
+    ZAMOCFile File(FILE_NAME);
+    File.Remove("k");
+    File.Set("n", "v", szFormat);
+    EXPECT_EQ(File.Save(), -1) << szFormat;
   }
-  EXPECT_EQ(ZAMOCFileSetKeyValue(FILE_NAME, "", "v", "%s=%s\n"), -1);
+  ZAMOCFile NoKey(FILE_NAME);
+  NoKey.Set("", "v", "%s=%s\n");
+  EXPECT_EQ(NoKey.Save(), -1);
   EXPECT_EQ(Set(FILE_NAME, "v\nx=1"), -1);
+  ZAMOCFile Missing("/var/services/camveld/missing");
+  Missing.Remove("k");
+  WriteFile("/var/services/camveld/missing", "k=1\n");
+  EXPECT_EQ(Missing.Save(), -1);
+  EXPECT_EQ(ReadFile(FILE_NAME), "k=1\n");
+}
+
+TEST_F(CapabilityFile, ChangesOfOthersAreKept) {
+  WriteFile(FILE_NAME, "k=1\nr=1\n");
+  ZAMOCFile File(FILE_NAME);
+  File.Set("k", "2", "%s=%s\n");
+  File.Set("k", "3", "%s=%s\n");
+  File.Remove("r");
+  WriteFile(FILE_NAME, "other=1\nr=2\nk=2\n");
+  EXPECT_EQ(File.Get("k"), "1");
+  EXPECT_EQ(File.Save(), 0);
+  EXPECT_EQ(ReadFile(FILE_NAME), "other=1\nk=3\n");
 }
 
 TEST_F(CapabilityFile, ReplacementHasTheOldOnesRights) {
