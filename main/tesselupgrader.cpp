@@ -441,6 +441,11 @@ static std::string GetConfKeyValue(const ZAMOCFile& File, const std::string& str
   return szValue;
 }
 
+static DIR* OpenDir(const char* szDir) {
+  const fileops::NoCancel Guard;  // a cancelled open would lose its descriptor
+  return opendir(szDir);
+}
+
 struct DirCloser {
   void operator()(DIR* pDir) const {
     const fileops::NoCancel Guard;
@@ -457,7 +462,7 @@ static int ForEachCapFile(int (*pUpgradeFile)(ZAMOCFile& File)) {
   }
   char szCapPath[512];  // deliberately truncates longer names
   snprintf(szCapPath, sizeof(szCapPath), "%s", gstrRemoteCapDir.c_str());
-  const std::unique_ptr<DIR, DirCloser> pDir(opendir(szCapPath));
+  const std::unique_ptr<DIR, DirCloser> pDir(OpenDir(szCapPath));
   if (pDir == nullptr) {
     return 0;
   }

@@ -218,6 +218,7 @@ int ChangeFile(const std::string& strFile, const std::vector<Change>& Changes) {
 }  // namespace
 
 ZAMOCFile::ZAMOCFile(std::string strFile) : m_strFile(std::move(strFile)) {
+  const fileops::NoCancel Guard;  // a cancelled open would lose its descriptor
   const ReadResult Result = ReadFile(m_strFile, &m_strText, nullptr);
   m_blRead = Result == ReadResult::Read;
   if (!m_blRead && Result != ReadResult::NoCapabilityFile) {
@@ -251,6 +252,7 @@ void ZAMOCFile::Note(const std::string& strKey, const std::string& strNewLine) {
 }
 
 int ZAMOCFile::Save() {
+  const fileops::NoCancel Guard;
   if (!m_blValid) {
     errno = EINVAL;
     return ReportFailure(m_strFile, "change of a key");

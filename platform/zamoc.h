@@ -16,7 +16,7 @@
 //
 // An advisory lock on the directory serializes changes of its files in all processes. A change
 // waits up to ten seconds for the lock. If a file cannot be read or changed, the reason goes to
-// syslog at LOG_ERR.
+// syslog at LOG_ERR. A request to cancel the thread waits until a call ends.
 #pragma once
 
 #include <string>
