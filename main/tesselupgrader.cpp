@@ -9,6 +9,7 @@
 #include <dirent.h>
 #include <malloc.h>
 #include <sys/stat.h>
+#include <syslog.h>
 
 #include <algorithm>
 #include <cstddef>
@@ -455,7 +456,8 @@ struct DirCloser {
 
 // Calls pUpgradeFile for every entry of the capability directory, of any type and name, until a
 // call fails. Returns -1 if a call failed or if there is no capability directory. A directory that
-// cannot be opened counts as empty; a read error counts as its end.
+// cannot be opened counts as empty; a read error counts as its end, and so does a file that cannot
+// be saved because another program keeps the directory locked.
 static int ForEachCapFile(int (*pUpgradeFile)(ZAMOCFile& File)) {
   if (gstrRemoteCapDir.empty()) {
     return -1;
@@ -466,14 +468,19 @@ static int ForEachCapFile(int (*pUpgradeFile)(ZAMOCFile& File)) {
   if (pDir == nullptr) {
     return 0;
   }
+  static ZAMOCPatience Patience;  // all walks of a run together wait so long
   while (const dirent* pEntry = readdir(pDir.get())) {
     const std::string strName = pEntry->d_name;
     if (strName == "." || strName == "..") {
       continue;
     }
-    ZAMOCFile File(szCapPath + ("/" + strName));
+    ZAMOCFile File(szCapPath + ("/" + strName), &Patience);
     if (pUpgradeFile(File) != 0) {
       return -1;
+    }
+    if (File.StayedLocked()) {
+      syslog(LOG_ERR, "%s: no further file is changed", szCapPath);
+      return 0;
     }
   }
   return 0;

@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <memory>
@@ -26,7 +27,6 @@ using caplines::FormatLine;
 
 namespace {
 
-constexpr int DIR_LOCK_TIMEOUT_SEC = 10;
 constexpr size_t MAX_FILE_SIZE = size_t{16} * 1024 * 1024;
 constexpr const char* TMP_NAME = "/.zamoc.tmp";
 
@@ -193,31 +193,22 @@ bool IsLink(const std::string& strFile) {
   return lstat(strFile.c_str(), &Stat) == 0 && S_ISLNK(Stat.st_mode);
 }
 
-int ChangeFile(const std::string& strFile, const std::vector<Change>& Changes) {
-  std::string strReal = strFile;
-  if (strReal.find('/') == std::string::npos || IsLink(strFile)) {
-    // Keep a symbolic link and replace the file that it leads to.
-    const std::unique_ptr<char, decltype(&free)> pReal(realpath(strFile.c_str(), nullptr), free);
-    if (pReal == nullptr) {
-      return ReportFailure(strFile, "realpath");
-    }
-    strReal = pReal.get();
-  }
-  const std::string strDir = strReal.substr(0, std::max<size_t>(strReal.rfind('/'), 1));
-  const fileops::Descriptor Dir(open(strDir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  if (Dir.Get() == -1) {
-    return ReportFailure(strFile, "open of the directory");
-  }
-  // Concurrent changes must not undo each other.
-  if (KiFlock::Lock(Dir.Get(), DIR_LOCK_TIMEOUT_SEC, true) != 0) {
-    return ReportFailure(strFile, "lock of the directory");
-  }
-  return ReplaceFile(strReal, strDir, Dir.Get(), Changes);
-}
-
 }  // namespace
 
-ZAMOCFile::ZAMOCFile(std::string strFile) : m_strFile(std::move(strFile)) {
+int ZAMOCPatience::Lock(int Fd) {
+  if (KiFlock::Lock(Fd, 0, true) == 0) {
+    return 0;
+  }
+  const auto Start = std::chrono::steady_clock::now();
+  const int Err = KiFlock::Lock(Fd, static_cast<int>(m_LeftMsec / 1000), true);
+  const auto Waited = std::chrono::steady_clock::now() - Start;
+  m_LeftMsec -= std::chrono::duration_cast<std::chrono::milliseconds>(Waited).count();
+  m_LeftMsec = std::max<int64_t>(m_LeftMsec, 0);
+  return Err;
+}
+
+ZAMOCFile::ZAMOCFile(std::string strFile, ZAMOCPatience* pPatience)
+    : m_strFile(std::move(strFile)), m_pPatience(pPatience) {
   const fileops::NoCancel Guard;  // a cancelled open would lose its descriptor
   const ReadResult Result = ReadFile(m_strFile, &m_strText, nullptr);
   m_blRead = Result == ReadResult::Read;
@@ -266,7 +257,30 @@ int ZAMOCFile::Save() {
   if (ChangeLines(m_strText, m_Changes) == m_strText) {
     return 0;
   }
-  return ChangeFile(m_strFile, m_Changes);
+  return ChangeFile();
+}
+
+int ZAMOCFile::ChangeFile() {
+  std::string strReal = m_strFile;
+  if (strReal.find('/') == std::string::npos || IsLink(m_strFile)) {
+    // Keep a symbolic link and replace the file that it leads to.
+    const std::unique_ptr<char, decltype(&free)> pReal(realpath(m_strFile.c_str(), nullptr), free);
+    if (pReal == nullptr) {
+      return ReportFailure(m_strFile, "realpath");
+    }
+    strReal = pReal.get();
+  }
+  const std::string strDir = strReal.substr(0, std::max<size_t>(strReal.rfind('/'), 1));
+  const fileops::Descriptor Dir(open(strDir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (Dir.Get() == -1) {
+    return ReportFailure(m_strFile, "open of the directory");
+  }
+  // Concurrent changes must not undo each other.
+  if (m_pPatience->Lock(Dir.Get()) != 0) {
+    m_blStayedLocked = true;
+    return ReportFailure(m_strFile, "lock of the directory");
+  }
+  return ReplaceFile(strReal, strDir, Dir.Get(), m_Changes);
 }
 
 void ZAMOCCopyright() { puts(ZAMOC_BANNER); }

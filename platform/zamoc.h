@@ -19,17 +19,31 @@
 // syslog at LOG_ERR. A request to cancel the thread waits until a call ends.
 #pragma once
 
+#include <cstdint>
 #include <string>
 #include <vector>
 
 #include "caplines.h"
 
+// The time for which changes may wait for locks: ten seconds altogether. Must not be used by two
+// threads at a time.
+class ZAMOCPatience {
+ public:
+  // Acquires an exclusive lock on the open directory Fd. Returns 0, or -1 with errno. Tries once if
+  // the time is over.
+  int Lock(int Fd);
+
+ private:
+  int64_t m_LeftMsec = 10000;
+};
+
 // One capability file: its keys when the object was made, and the changes to make. Must not be used
 // by two threads at a time.
 class ZAMOCFile {
  public:
-  // Reads the file. If it cannot be read, the object has no keys.
-  explicit ZAMOCFile(std::string strFile);
+  // Reads the file. If it cannot be read, the object has no keys. *pPatience must outlive the
+  // object.
+  ZAMOCFile(std::string strFile, ZAMOCPatience* pPatience);
   ZAMOCFile(const ZAMOCFile&) = delete;
   ZAMOCFile& operator=(const ZAMOCFile&) = delete;
 
@@ -54,12 +68,18 @@ class ZAMOCFile {
   // read.
   int Save();
 
+  // True if Save has failed because the directory stayed locked.
+  bool StayedLocked() const { return m_blStayedLocked; }
+
  private:
+  int ChangeFile();
   void Note(const std::string& strKey, const std::string& strNewLine);
 
   const std::string m_strFile;
+  ZAMOCPatience* const m_pPatience;
   std::string m_strText;
   bool m_blRead = false;
+  bool m_blStayedLocked = false;
   bool m_blValid = true;  // all changes form a line
   std::vector<caplines::Change> m_Changes;
 };

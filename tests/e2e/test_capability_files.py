@@ -1,6 +1,8 @@
 """What the tool makes of capability files, also of strange ones."""
 
+import fcntl
 import os
+import time
 
 import pytest
 from conftest import STRACE
@@ -67,3 +69,18 @@ def test_what_a_failed_call_costs(appliance, call, error, changed):
     result = appliance.upgrade("--updateCap", CAPS, under=under)
     assert result.status == (0 if changed == 2 else 255)
     assert list(appliance.capability_files().values()).count("") == changed
+
+
+def test_a_run_waits_ten_seconds_for_the_directory(appliance):
+    # Both actions would change both files.
+    for name in "ab":
+        appliance.capability_file(name, "pan=yes\ntilt=continuous\n")
+    files = appliance.capability_files()
+    lock = os.open(CAPS, os.O_RDONLY)
+    fcntl.flock(lock, fcntl.LOCK_EX)
+    start = time.monotonic()
+    result = appliance.upgrade("--updateCap", CAPS)
+    waited = time.monotonic() - start
+    os.close(lock)
+    assert (result.status, appliance.capability_files()) == (0, files)
+    assert 9 < waited < 19

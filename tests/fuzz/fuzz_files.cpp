@@ -10,23 +10,24 @@
 #include "zamoc.h"
 
 static constexpr const char* NAME = "/var/file";
+static ZAMOCPatience gPatience;
 
 static void FuzzCapabilityFile(const std::string& strText, const std::string& strVal) {
   WriteFile(NAME, strText);
-  ZAMOCFile Old(NAME);
+  ZAMOCFile Old(NAME, &gPatience);
   Old.Remove("k");
   assert(Old.Save() == 0);
-  assert(ZAMOCFile(NAME).Get("k").empty());
+  assert(ZAMOCFile(NAME, &gPatience).Get("k").empty());
   std::string strExpected = ReadFile(NAME);
   strExpected += strExpected.empty() || strExpected.back() == '\n' ? "" : "\n";
   strExpected += "k=" + strVal + "\n";
   for (int Time = 0; Time < 2; ++Time) {
-    ZAMOCFile File(NAME);
+    ZAMOCFile File(NAME, &gPatience);
     File.Set("k", strVal, "%s=%s\n");
     assert(File.Save() == 0);
     assert(ReadFile(NAME) == strExpected);
   }
-  assert(ZAMOCFile(NAME).Get("k") == strVal);
+  assert(ZAMOCFile(NAME, &gPatience).Get("k") == strVal);
 }
 
 static void FuzzKeyValueFile(const std::string& strText, const std::string& strVal) {

@@ -12,11 +12,13 @@ using namespace std::string_literals;
 constexpr const char* FILE_NAME = "/var/services/camveld/file";
 constexpr const char* LEFT_BEHIND = "/var/services/camveld/.zamoc.tmp";
 
+ZAMOCPatience gPatience;
+
 class CapabilityFile : public PrivateVar {};
 class Database : public PrivateVar {};
 
 int Set(const char* szFile, const char* szValue) {
-  ZAMOCFile File(szFile);
+  ZAMOCFile File(szFile, &gPatience);
   File.Set("k", szValue, "%s= %s\n");
   return File.Save();
 }
@@ -41,7 +43,7 @@ TEST_F(CapabilityFile, LinesAreReadAndChanged) {
   };
   for (const auto& Case : rgCase) {
     WriteFile(FILE_NAME, Case.strBefore);
-    EXPECT_EQ(ZAMOCFile(FILE_NAME).Get("k"), Case.strGot) << Case.strBefore;
+    EXPECT_EQ(ZAMOCFile(FILE_NAME, &gPatience).Get("k"), Case.strGot) << Case.strBefore;
     Set(FILE_NAME, "new");
     EXPECT_EQ(ReadFile(FILE_NAME), Case.strAfter);
   }
@@ -50,16 +52,16 @@ TEST_F(CapabilityFile, LinesAreReadAndChanged) {
 TEST_F(CapabilityFile, AllChangesAreMadeOrNone) {
   WriteFile(FILE_NAME, "k=1\n");
   for (const char* szFormat : {"%s=\n", "%s=%s%n\n", "%s=%s", "#%s=%s\n"}) {
-    ZAMOCFile File(FILE_NAME);
+    ZAMOCFile File(FILE_NAME, &gPatience);
     File.Remove("k");
     File.Set("n", "v", szFormat);
     EXPECT_EQ(File.Save(), -1) << szFormat;
   }
-  ZAMOCFile NoKey(FILE_NAME);
+  ZAMOCFile NoKey(FILE_NAME, &gPatience);
   NoKey.Set("", "v", "%s=%s\n");
   EXPECT_EQ(NoKey.Save(), -1);
   EXPECT_EQ(Set(FILE_NAME, "v\nx=1"), -1);
-  ZAMOCFile Missing("/var/services/camveld/missing");
+  ZAMOCFile Missing("/var/services/camveld/missing", &gPatience);
   Missing.Remove("k");
   WriteFile("/var/services/camveld/missing", "k=1\n");
   EXPECT_EQ(Missing.Save(), -1);
@@ -68,7 +70,7 @@ TEST_F(CapabilityFile, AllChangesAreMadeOrNone) {
 
 TEST_F(CapabilityFile, ChangesOfOthersAreKept) {
   WriteFile(FILE_NAME, "k=1\nr=1\n");
-  ZAMOCFile File(FILE_NAME);
+  ZAMOCFile File(FILE_NAME, &gPatience);
   File.Set("k", "2", "%s=%s\n");
   File.Set("k", "3", "%s=%s\n");
   File.Remove("r");
