@@ -15,7 +15,7 @@ typedef enum __DB_INSTANCE : int {
 
 // Opens the database, runs strCommand between "BEGIN;" and ";COMMIT;", and closes the database.
 // Returns 0. If the database cannot be opened or a statement fails, logs the failure, commits
-// nothing and returns -1.
+// nothing and returns -1. ZAMODBError then gives the reason.
 //
 // If a query succeeds and ppResult is not null, *ppResult receives the result set, which the caller
 // releases with KiDBFreeResult. If there is no result set, *ppResult is unchanged: set it to null

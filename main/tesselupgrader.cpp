@@ -12,6 +12,7 @@
 #include <syslog.h>
 
 #include <algorithm>
+#include <cctype>
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
@@ -41,13 +42,26 @@ static int KiAtoi(const char* szText) { return szText == nullptr ? 0 : StrToInt3
 
 // --- Helpers of the actions ---
 
-// Runs strSqlCmd as one transaction on the system database. Logs a failure with the line and the
+// Sends one record with the name of an action and the reason for its failure to syslog. Replaces
+// control characters, which names and values may contain, so that a record cannot look like two. A
+// record of any length might not be accepted.
+static void ReportFailure(const char* szAction, std::string strReason) {
+  constexpr size_t MaxReasonLen = 1000;
+  strReason.resize(std::min(strReason.size(), MaxReasonLen));
+  for (char& Byte : strReason) {
+    Byte = iscntrl(static_cast<unsigned char>(Byte)) != 0 ? '?' : Byte;
+  }
+  syslog(LOG_ERR, "%s: %s", szAction, strReason.c_str());
+}
+
+// Runs strSqlCmd as one transaction on the system database. Logs and reports a failure with the
 // name of the calling action, which the default arguments supply. Returns 0 or -1.
 static int RunSql(const std::string& strSqlCmd, DBResult_tag** ppResult = nullptr,
                   int LineNo = __builtin_LINE(), const char* szFunc = __builtin_FUNCTION()) {
   if (KiDB::Execute(KiDB::DBI_SYSTEM, strSqlCmd, ppResult, false) != 0) {
     KiPrintf(KI_LOG, nullptr, nullptr, __FILE__, LineNo, szFunc,
              "KiDBExecute command (%s) error.\n", strSqlCmd.c_str());
+    ReportFailure(szFunc, ZAMODBError());
     return -1;
   }
   return 0;
@@ -389,6 +403,7 @@ static int UpdateAxisA8105E() {
     if (ZAMODBFetchRow(Result.pResult, &Row) != 0) {
       KiPrintf(KI_LOG, nullptr, nullptr, __FILE__, __LINE__, __func__,
                "Failed to get camera info.\n");
+      ReportFailure(__func__, "a row of the result is missing");
       return -1;
     }
     const char* szWire = ZAMODBFetchField(Result.pResult, Row, "connected_wire");

@@ -2,7 +2,6 @@
 
 #include <sqlite3.h>
 #include <sys/stat.h>
-#include <syslog.h>
 
 #include <cerrno>
 #include <cstring>
@@ -46,6 +45,9 @@ constexpr const char* SETTINGS =
     // pages get SQLite's own size, because each write before the commit costs another sync.
     "PRAGMA cache_size = -128; PRAGMA cache_spill = -2000";
 
+// Why the last call of this thread failed.
+thread_local std::string gstrError;
+
 struct StatementFinalizer {
   void operator()(sqlite3_stmt* pStatement) const {
     const fileops::NoCancel Guard;  // finalizing may end a transaction, and so write
@@ -66,9 +68,15 @@ const char* WhyNoRegularFile(const char* szPath) {
   return S_ISDIR(Stat.st_mode) ? strerror(EISDIR) : "Not a regular file";
 }
 
-void ReportFailure(sqlite3* pDb, const char* szDBName, const char* szReason) {
-  syslog(LOG_ERR, "zamodb: [%s]: %s (extended code %d)", szDBName, szReason,
-         sqlite3_extended_errcode(pDb));
+// The system's or this layer's reason.
+void SetError(const char* szDBName, const char* szReason) {
+  gstrError = std::string(szDBName) + ": " + szReason;
+}
+
+// SQLite's reason.
+void SetError(sqlite3* pDb, const char* szReason) {
+  const int Code = sqlite3_extended_errcode(pDb);
+  gstrError = szReason + (" (extended code " + std::to_string(Code) + ")");
 }
 
 // Without memory statistics, which nobody reads, no allocation takes a lock. That saves 15 % of the
@@ -140,21 +148,21 @@ DBConnect* ZAMODBConnect(const char* /*szHost*/, const char* /*szUser*/, const c
                          const char* szDBName) {
   // SQLite would open a temporary database for an empty name and one in memory for ":memory:".
   if (szDBName == nullptr) {
-    return nullptr;
+    szDBName = "";
   }
   if (const char* szReason = WhyNoRegularFile(szDBName)) {
-    syslog(LOG_ERR, "zamodb: [%s]: %s", szDBName, szReason);
+    SetError(szDBName, szReason);
     return nullptr;
   }
   static const bool blConfigured = ConfigureSqlite();
   static_cast<void>(blConfigured);
   auto pConn = std::make_unique<DBConnect>();
   if (sqlite3_open_v2(szDBName, &pConn->m_pDb, SQLITE_OPEN_READWRITE, nullptr) != SQLITE_OK) {
-    ReportFailure(pConn->m_pDb, szDBName, sqlite3_errmsg(pConn->m_pDb));
+    SetError(pConn->m_pDb, sqlite3_errmsg(pConn->m_pDb));
     return nullptr;
   }
   if (sqlite3_db_readonly(pConn->m_pDb, "main") != 0) {
-    ReportFailure(pConn->m_pDb, szDBName, "the file cannot be written");
+    SetError(szDBName, "the file cannot be written");
     return nullptr;
   }
   // A text may contain what a camera's row says. Without ATTACH and VACUUM INTO, which both attach
@@ -166,6 +174,7 @@ DBConnect* ZAMODBConnect(const char* /*szHost*/, const char* /*szUser*/, const c
 
 int ZAMODBExecute(DBConnect* pConn, const char* szSqlCmd, DBResult** ppResult) {
   if (pConn == nullptr || szSqlCmd == nullptr) {
+    gstrError = "no connection or no text";
     return -1;
   }
   sqlite3* pDb = pConn->m_pDb;
@@ -184,7 +193,7 @@ int ZAMODBExecute(DBConnect* pConn, const char* szSqlCmd, DBResult** ppResult) {
     szReason = "the text leaves a transaction open";
   }
   if (szReason != nullptr) {
-    ReportFailure(pDb, sqlite3_db_filename(pDb, "main"), szReason);
+    SetError(pDb, szReason);
     if (sqlite3_get_autocommit(pDb) == 0) {
       sqlite3_exec(pDb, "ROLLBACK", nullptr, nullptr, nullptr);
     }
@@ -195,6 +204,8 @@ int ZAMODBExecute(DBConnect* pConn, const char* szSqlCmd, DBResult** ppResult) {
   }
   return 0;
 }
+
+const char* ZAMODBError() { return gstrError.c_str(); }
 
 unsigned int ZAMODBNumRows(const DBResult* pResult) {
   return pResult == nullptr ? 0 : static_cast<unsigned int>(pResult->m_Rows.size());

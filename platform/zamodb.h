@@ -1,7 +1,6 @@
 // Connections, statements and result sets of the package's SQLite databases.
 //
-// Only one thread at a time may use a connection or a result set. The reason for a failure and the
-// database's name go to syslog at LOG_ERR.
+// Only one thread at a time may use a connection or a result set.
 #pragma once
 
 struct DBConnect_tag;
@@ -29,6 +28,11 @@ DBConnect* ZAMODBConnect(const char* szHost, const char* szUser, const char* szP
 // copies and outlives the connection. On failure, or if no statement returns columns, *ppResult is
 // unchanged.
 int ZAMODBExecute(DBConnect* pConn, const char* szSqlCmd, DBResult** ppResult);
+
+// Why the calling thread's last ZAMODBConnect or ZAMODBExecute failed: SQLite's reason with its
+// extended code, or the name of the database with the system's reason. It may contain any bytes of
+// the text. Valid until the thread's next failure.
+const char* ZAMODBError();
 
 // Number of rows; 0 for null.
 unsigned int ZAMODBNumRows(const DBResult* pResult);

@@ -128,7 +128,18 @@ std::string Between(const std::string& strText, const char* szBegin, const char*
   return strText.substr(Start, End - Start);
 }
 
-// The log names the failed actions. Syslog has their reasons, in the same order.
+// The part of a record before the first ": ", which is removed from it; "" if there is none.
+std::string TakePart(std::string* pRecord) {
+  const size_t End = pRecord->find(": ");
+  if (End == std::string::npos) {
+    return "";
+  }
+  const std::string strPart = pRecord->substr(0, End);
+  pRecord->erase(0, End + 2);
+  return strPart;
+}
+
+// The log names the failed actions. Syslog has a record with name and reason for each.
 std::vector<FailedAction> FailedActions(const std::string& strLog,
                                         const std::vector<std::string>& Records) {
   std::vector<FailedAction> Failures;
@@ -136,14 +147,16 @@ std::vector<FailedAction> FailedActions(const std::string& strLog,
   for (std::string strLine; std::getline(Log, strLine);) {
     const std::string strName = Between(strLine, ":", "(): KiDBExecute command (");
     if (!strName.empty()) {
-      Failures.push_back({strName, "the database cannot be opened", false});
+      Failures.push_back({strName, "the reason is unknown", false});
     }
   }
-  size_t Action = 0;
-  for (const std::string& strRecord : Records) {
-    const std::string strReason = Between(strRecord, "]: ", " (extended code ");
-    if (strRecord.find("zamodb: [") != std::string::npos && Action < Failures.size()) {
-      Failures[Action++].strReason = strReason;
+  for (std::string strReason : Records) {
+    TakePart(&strReason);  // time and program
+    const std::string strName = TakePart(&strReason);
+    for (FailedAction& Failure : Failures) {
+      if (Failure.strName == strName) {
+        Failure.strReason = strReason.substr(0, strReason.find(" (extended code "));
+      }
     }
   }
   return Failures;

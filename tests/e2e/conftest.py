@@ -25,6 +25,9 @@ STRACE = "strace -o /dev/null -E ASAN_OPTIONS=detect_leaks=0".split()
 # Time, process and line number of a log line.
 LOG_PREFIX = re.compile(r"^.{15}[.\d]* \[\d+\] ?|(?<=\.cpp):\d+")
 
+# User, error, time and program of a syslog record.
+SYSLOG_PREFIX = re.compile(r"^<11>.{15} tesselupgrader: ")
+
 
 def pytest_addoption(parser):
     parser.addoption("--build", default="build/dev", help="the build tree")
@@ -216,7 +219,7 @@ def example(appliance):
 
 @pytest.fixture
 def syslog():
-    """A function that returns the records since its last call.
+    """A function that returns the tool's records since its last call.
 
     More than ten unread records stall their sender.
     """
@@ -229,7 +232,7 @@ def syslog():
             with suppress(BlockingIOError):
                 while True:
                     found.append(log.recv(65536).decode())
-            return found
+            return [SYSLOG_PREFIX.sub("", record) for record in found]
 
         yield records
     os.unlink("/dev/log")

@@ -20,10 +20,10 @@ ABSENT = [
 
 @pytest.mark.parametrize("make, reason", ABSENT)
 def test_without_a_database_syslog_says_why(appliance, syslog, make, reason):
-    last = max(threshold for threshold, _ in tables()[0])
+    last, name = tables()[0][-1]
     make(appliance.database)
     assert appliance.upgrade(last - 1).status == 255
-    assert reason in "".join(syslog())
+    assert syslog() == [f"{name}: {appliance.database}: {reason}"]
 
 
 DAMAGE = [
@@ -68,7 +68,20 @@ def test_a_value_reaches_no_other_file(example, syslog, escape):
     example.sql(f"UPDATE camera {wired}")
     assert example.upgrade(2400).status == 255
     assert outside.read_bytes() == b""
-    assert "too many attached databases" in "".join(syslog())
+    reason = "too many attached databases - max 0 (extended code 1)"
+    assert syslog() == [f"UpdateAxisA8105E: {reason}"]
+
+
+def test_a_failed_action_has_one_record_of_one_line(example, syslog):
+    assert (example.upgrade(0).status, syslog()) == (0, [])
+    example.sql(
+        "CREATE TRIGGER guard BEFORE UPDATE ON camera BEGIN "
+        "SELECT raise(ABORT, 'guard says\n<3>no'); END;"
+        "INSERT INTO camera (vendor, model) VALUES ('ASUS', 'AiCam NightView')"
+    )
+    assert example.upgrade(2472).status == 255
+    reason = "guard says?<3>no (extended code 1811)"
+    assert syslog() == [f"RenameASUSAiCamNightViewModel: {reason}"]
 
 
 def test_many_cameras_need_no_temporary_file(example, tmp_path):
