@@ -13,6 +13,7 @@
 
 #include <algorithm>
 #include <cctype>
+#include <cerrno>
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
@@ -52,6 +53,12 @@ static void ReportFailure(const char* szAction, std::string strReason) {
     Byte = iscntrl(static_cast<unsigned char>(Byte)) != 0 ? '?' : Byte;
   }
   syslog(LOG_ERR, "%s: %s", szAction, strReason.c_str());
+}
+
+// The system's reason for a failure at a path, from errno.
+static std::string SystemReason(const char* szPath) {
+  const char* const szReason = strerror(errno);
+  return std::string(szPath) + ": " + szReason;
 }
 
 // Runs strSqlCmd as one transaction on the system database. Logs and reports a failure with the
@@ -469,34 +476,50 @@ struct DirCloser {
   }
 };
 
+// The next entry other than "." and "..". Null at the end, with errno 0, and after an error.
+static const dirent* NextEntry(DIR* pDir) {
+  const dirent* pEntry = nullptr;
+  do {
+    errno = 0;
+    pEntry = readdir(pDir);
+  } while (pEntry != nullptr &&
+           (strcmp(pEntry->d_name, ".") == 0 || strcmp(pEntry->d_name, "..") == 0));
+  return pEntry;
+}
+
 // Calls pUpgradeFile for every entry of the capability directory, of any type and name, until a
 // call fails. Returns -1 if a call failed or if there is no capability directory. A directory that
 // cannot be opened counts as empty; a read error counts as its end, and so does a file that cannot
-// be saved because another program keeps the directory locked.
-static int ForEachCapFile(int (*pUpgradeFile)(ZAMOCFile& File)) {
+// be saved because another program keeps the directory locked. Reports each failure with the name
+// of the calling action, which the default argument supplies.
+static int ForEachCapFile(int (*pUpgradeFile)(ZAMOCFile& File),
+                          const char* szAction = __builtin_FUNCTION()) {
+  static ZAMOCPatience Patience;  // all walks of a run together wait so long
   if (gstrRemoteCapDir.empty()) {
+    ReportFailure(szAction, "there is no capability directory");
     return -1;
   }
   char szCapPath[512];  // deliberately truncates longer names
   snprintf(szCapPath, sizeof(szCapPath), "%s", gstrRemoteCapDir.c_str());
   const std::unique_ptr<DIR, DirCloser> pDir(OpenDir(szCapPath));
   if (pDir == nullptr) {
+    ReportFailure(szAction, SystemReason(szCapPath));
     return 0;
   }
-  static ZAMOCPatience Patience;  // all walks of a run together wait so long
-  while (const dirent* pEntry = readdir(pDir.get())) {
+  while (const dirent* pEntry = NextEntry(pDir.get())) {
     const std::string strName = pEntry->d_name;
-    if (strName == "." || strName == "..") {
-      continue;
-    }
     ZAMOCFile File(szCapPath + ("/" + strName), &Patience);
-    if (pUpgradeFile(File) != 0) {
-      return -1;
+    const int Err = pUpgradeFile(File);
+    if (!File.Error().empty()) {
+      const char* szEnd = File.StayedLocked() ? "; later files are left alone" : "";
+      ReportFailure(szAction, strName + ": " + File.Error() + szEnd);
     }
-    if (File.StayedLocked()) {
-      syslog(LOG_ERR, "%s: no further file is changed", szCapPath);
-      return 0;
+    if (Err != 0 || File.StayedLocked()) {
+      return Err == 0 ? 0 : -1;
     }
+  }
+  if (errno != 0) {
+    ReportFailure(szAction, SystemReason(szCapPath));
   }
   return 0;
 }

@@ -2,7 +2,6 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
-#include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -10,6 +9,7 @@
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -120,27 +120,27 @@ ReadResult ReadFile(const std::string& strFile, std::string* pText, struct stat*
   return ReadAll(File.Get(), static_cast<size_t>(Named.st_size), pText);
 }
 
-int ReportFailure(const std::string& strFile, const char* szStep) {
-  const fileops::ErrnoKeeper Errno;
-  syslog(LOG_ERR, "zamoc: [%s]: %s failed with errno [%d]", strFile.c_str(), szStep, Errno.Get());
-  return -1;
+// The reason for a failed step, from errno.
+std::string Reason(const char* szStep) {
+  const char* const szReason = strerror(errno);
+  return std::string(szStep) + ": " + szReason;
 }
 
-int ReportFailure(const std::string& strFile, ReadResult Result) {
+// Why the file has not been read; empty if it has.
+std::string Reason(ReadResult Result) {
   switch (Result) {
-    case ReadResult::OpenFailed:
-      return ReportFailure(strFile, "open");
-    case ReadResult::ReadFailed:
-      return ReportFailure(strFile, "read");
-    case ReadResult::TooLarge:
-      syslog(LOG_ERR, "zamoc: [%s]: larger than 16 MiB", strFile.c_str());
-      return -1;
     case ReadResult::Read:
+      return "";
     case ReadResult::NoCapabilityFile:
-      break;
+      return "no capability file";
+    case ReadResult::TooLarge:
+      return "larger than 16 MiB";
+    case ReadResult::OpenFailed:
+      return Reason("open");
+    case ReadResult::ReadFailed:
+      return Reason("read");
   }
-  syslog(LOG_ERR, "zamoc: [%s]: no capability file", strFile.c_str());
-  return -1;
+  return "";
 }
 
 // --- Changes ---
@@ -153,39 +153,40 @@ int SetOwnerAndMode(int Fd, const struct stat& Stat) {
 }
 
 // Replaces strFile with a changed copy. DirFd is its open directory. The copy is on stable storage
-// before it gets the file's name, so that a power cut leaves the old content or the new.
-int ReplaceFile(const std::string& strFile, const std::string& strDir, int DirFd,
-                const std::vector<Change>& Changes) {
+// before it gets the file's name, so that a power cut leaves the old content or the new. Returns
+// the reason for a failure, else an empty string.
+std::string ReplaceFile(const std::string& strFile, const std::string& strDir, int DirFd,
+                        const std::vector<Change>& Changes) {
   std::string strText;
   struct stat Stat;
   const ReadResult Result = ReadFile(strFile, &strText, &Stat);
   if (Result != ReadResult::Read) {
-    return ReportFailure(strFile, Result);
+    return Reason(Result);
   }
   strText = ChangeLines(strText, Changes);
   std::string strNew = strDir + TMP_NAME;
   const fileops::Descriptor New(fileops::CreateAnew(strNew.c_str()));
   if (New.Get() == -1) {
-    return ReportFailure(strFile, "creation of a temporary file");
+    return Reason("creation of a temporary file");
   }
   fileops::TmpFile NewName(std::move(strNew));  // a copy could fail and leave the file behind
   if (fileops::WriteAll(New.Get(), strText.data(), strText.size()) != 0) {
-    return ReportFailure(strFile, "copy");
+    return Reason("copy");
   }
   if (SetOwnerAndMode(New.Get(), Stat) != 0) {
-    return ReportFailure(strFile, "copy of owner and mode");
+    return Reason("copy of owner and mode");
   }
   if (fsync(New.Get()) != 0) {
-    return ReportFailure(strFile, "fsync");
+    return Reason("fsync");
   }
   if (NewName.RenameTo(strFile.c_str()) != 0) {
-    return ReportFailure(strFile, "rename");
+    return Reason("rename");
   }
   // EINVAL: this file system cannot sync a directory. That is no failure.
   if (fsync(DirFd) != 0 && errno != EINVAL) {
-    return ReportFailure(strFile, "fsync of the directory");
+    return Reason("fsync of the directory");
   }
-  return 0;
+  return "";
 }
 
 bool IsLink(const std::string& strFile) {
@@ -211,15 +212,15 @@ ZAMOCFile::ZAMOCFile(std::string strFile, ZAMOCPatience* pPatience)
     : m_strFile(std::move(strFile)), m_pPatience(pPatience) {
   const fileops::NoCancel Guard;  // a cancelled open would lose its descriptor
   const ReadResult Result = ReadFile(m_strFile, &m_strText, nullptr);
-  m_blRead = Result == ReadResult::Read;
-  if (!m_blRead && Result != ReadResult::NoCapabilityFile) {
-    ReportFailure(m_strFile, Result);
+  m_strUnread = Reason(Result);
+  if (Result != ReadResult::NoCapabilityFile) {
+    m_strError = m_strUnread;
   }
 }
 
 std::string ZAMOCFile::Get(const std::string& strKey) const {
   std::string_view Value;
-  return m_blRead && FindKey(m_strText, strKey, &Value) ? std::string(Value) : "";
+  return m_strUnread.empty() && FindKey(m_strText, strKey, &Value) ? std::string(Value) : "";
 }
 
 void ZAMOCFile::Set(const std::string& strKey, const std::string& strValue,
@@ -244,41 +245,38 @@ void ZAMOCFile::Note(const std::string& strKey, const std::string& strNewLine) {
 
 int ZAMOCFile::Save() {
   const fileops::NoCancel Guard;
-  if (!m_blValid) {
-    errno = EINVAL;
-    return ReportFailure(m_strFile, "change of a key");
-  }
   if (m_Changes.empty()) {
     return 0;
   }
-  if (!m_blRead) {
-    return ReportFailure(m_strFile, ReadResult::NoCapabilityFile);
+  if (!m_blValid) {
+    m_strError = "a change does not form one line";
+  } else if (!m_strUnread.empty()) {
+    m_strError = m_strUnread;
+  } else if (ChangeLines(m_strText, m_Changes) != m_strText) {
+    m_strError = ChangeFile();
   }
-  if (ChangeLines(m_strText, m_Changes) == m_strText) {
-    return 0;
-  }
-  return ChangeFile();
+  return m_strError.empty() ? 0 : -1;
 }
 
-int ZAMOCFile::ChangeFile() {
+std::string ZAMOCFile::ChangeFile() {
   std::string strReal = m_strFile;
   if (strReal.find('/') == std::string::npos || IsLink(m_strFile)) {
     // Keep a symbolic link and replace the file that it leads to.
     const std::unique_ptr<char, decltype(&free)> pReal(realpath(m_strFile.c_str(), nullptr), free);
     if (pReal == nullptr) {
-      return ReportFailure(m_strFile, "realpath");
+      return Reason("realpath");
     }
     strReal = pReal.get();
   }
   const std::string strDir = strReal.substr(0, std::max<size_t>(strReal.rfind('/'), 1));
   const fileops::Descriptor Dir(open(strDir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (Dir.Get() == -1) {
-    return ReportFailure(m_strFile, "open of the directory");
+    return Reason("open of the directory");
   }
   // Concurrent changes must not undo each other.
   if (m_pPatience->Lock(Dir.Get()) != 0) {
     m_blStayedLocked = true;
-    return ReportFailure(m_strFile, "lock of the directory");
+    return Reason("lock of the directory");
   }
   return ReplaceFile(strReal, strDir, Dir.Get(), m_Changes);
 }

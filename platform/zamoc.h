@@ -68,17 +68,22 @@ class ZAMOCFile {
   // read.
   int Save();
 
+  // Why the file could not be read, or why Save has last failed; empty if neither. A path that
+  // cannot lead to a capability file (missing, a directory, ...) is an error for Save only.
+  const std::string& Error() const { return m_strError; }
+
   // True if Save has failed because the directory stayed locked.
   bool StayedLocked() const { return m_blStayedLocked; }
 
  private:
-  int ChangeFile();
+  std::string ChangeFile();
   void Note(const std::string& strKey, const std::string& strNewLine);
 
   const std::string m_strFile;
   ZAMOCPatience* const m_pPatience;
   std::string m_strText;
-  bool m_blRead = false;
+  std::string m_strUnread;  // why it was not read; empty if it was
+  std::string m_strError;
   bool m_blStayedLocked = false;
   bool m_blValid = true;  // all changes form a line
   std::vector<caplines::Change> m_Changes;

@@ -139,7 +139,8 @@ std::string TakePart(std::string* pRecord) {
   return strPart;
 }
 
-// The log names the failed actions. Syslog has a record with name and reason for each.
+// The log names the failed actions on the database. Syslog has name and reason of each failure; an
+// action on capability files also names the file.
 std::vector<FailedAction> FailedActions(const std::string& strLog,
                                         const std::vector<std::string>& Records) {
   std::vector<FailedAction> Failures;
@@ -153,30 +154,21 @@ std::vector<FailedAction> FailedActions(const std::string& strLog,
   for (std::string strReason : Records) {
     TakePart(&strReason);  // time and program
     const std::string strName = TakePart(&strReason);
+    bool blDatabase = false;
     for (FailedAction& Failure : Failures) {
-      if (Failure.strName == strName) {
+      if (!Failure.blFile && Failure.strName == strName) {
         Failure.strReason = strReason.substr(0, strReason.find(" (extended code "));
+        blDatabase = true;
       }
+    }
+    // Records of the log writer begin with a source file.
+    if (!blDatabase && !strName.empty() && strName.find('.') == std::string::npos) {
+      const std::string strFile = TakePart(&strReason);
+      Failures.push_back(
+          {"capability file " + strFile.substr(strFile.rfind('/') + 1), strReason, true});
     }
   }
   return Failures;
-}
-
-// The record of a file that could not be read or replaced has its name, the step and errno.
-void AddFailedFiles(const std::vector<std::string>& Records, std::vector<FailedAction>* pFailed) {
-  for (const std::string& strRecord : Records) {
-    const std::string strFile = Between(strRecord, "zamoc: [", "]: ");
-    const std::string strStep = Between(strRecord, "]: ", " failed with errno [");
-    const std::string strErrno = Between(strRecord, "[", "]\n").empty()
-                                     ? strRecord.substr(strRecord.rfind('[') + 1)
-                                     : Between(strRecord, "[", "]\n");
-    if (!strFile.empty() && !strStep.empty()) {
-      pFailed->push_back(
-          {"capability file " + strFile.substr(strFile.rfind('/') + 1),
-           strStep + ": " + strerror(static_cast<int>(strtol(strErrno.c_str(), nullptr, 10))),
-           true});
-    }
-  }
 }
 
 }  // namespace
@@ -220,7 +212,6 @@ UpgradeRun Tool::Upgrade(const std::string& strVersion) const {
   Upgrade.Status = Result.Status;
   const std::string strLog = m_strTarget + "/log/camveld.log";
   Upgrade.Failures = FailedActions(Exists(strLog) ? ReadWholeFile(strLog) : "", Result.Records);
-  AddFailedFiles(Result.Records, &Upgrade.Failures);
   Upgrade.CapActions = CountOpenings(Openings.Get());
   return Upgrade;
 }

@@ -6,17 +6,35 @@ import time
 
 import pytest
 from conftest import STRACE
+from test_migrations import tables
 
 CAPS = "/var/packages/Camveld/target/@camveld/@KICapInfo"
 MARKER = "ptz_continuous_move"
+MOVE, SPEED = (name for _, name in tables()[1])
 
 
 @pytest.mark.parametrize("marker, status", [("", 0), (f"{MARKER}=yes\n", 255)])
-def test_only_the_removal_of_the_marker_has_to_work(appliance, marker, status):
+def test_only_the_removal_of_the_marker_has_to_work(
+    appliance, syslog, marker, status
+):
     (appliance.caps / ".zamoc.tmp").mkdir()
     file = appliance.capability_file("camera", "pan=yes\n" + marker)
     assert appliance.upgrade("--updateCap", CAPS).status == status
     assert file.read_text() == "pan=yes\n" + marker
+    step = "creation of a temporary file"
+    assert syslog() == [f"{MOVE}: camera: {step}: Is a directory"]
+
+
+def test_without_a_directory_syslog_says_so(syslog, appliance):
+    assert appliance.upgrade("--updateCap", "").status == 255
+    assert appliance.upgrade("--updateCap", "/none").status == 0
+    reasons = [
+        "there is no capability directory",
+        "/none: No such file or directory",
+    ]
+    assert syslog() == [
+        f"{name}: {reason}" for reason in reasons for name in (MOVE, SPEED)
+    ]
 
 
 def test_a_directory_of_strange_files(appliance, syslog):
@@ -45,7 +63,8 @@ def test_a_directory_of_strange_files(appliance, syslog):
     for file in files:
         assert file.read_text() == "pan= step\n", file
     assert (caps / "large").stat().st_size == 2**24 + 1
-    assert "/large]: larger than 16 MiB" in "".join(syslog())
+    reason = "large: larger than 16 MiB"
+    assert syslog() == [f"{MOVE}: {reason}", f"{SPEED}: {reason}"]
     assert (caps / "a").stat().st_mode & 0o777 == 0o400
     assert (caps / "binary").read_bytes() == binary + b"pan= step\n"
     assert (caps / "link").is_symlink()
@@ -71,7 +90,7 @@ def test_what_a_failed_call_costs(appliance, call, error, changed):
     assert list(appliance.capability_files().values()).count("") == changed
 
 
-def test_a_run_waits_ten_seconds_for_the_directory(appliance):
+def test_a_run_waits_ten_seconds_for_the_directory(appliance, syslog):
     # Both actions would change both files.
     for name in "ab":
         appliance.capability_file(name, "pan=yes\ntilt=continuous\n")
@@ -84,3 +103,7 @@ def test_a_run_waits_ten_seconds_for_the_directory(appliance):
     os.close(lock)
     assert (result.status, appliance.capability_files()) == (0, files)
     assert 9 < waited < 19
+    left = "Resource temporarily unavailable; later files are left alone"
+    for name, record in zip((MOVE, SPEED), syslog(), strict=True):
+        file, reason = record.split(": lock of the directory: ")
+        assert (file[:-1], reason) == (f"{name}: ", left)
