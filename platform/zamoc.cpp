@@ -152,9 +152,15 @@ int SetOwnerAndMode(int Fd, const struct stat& Stat) {
   return fchmod(Fd, Stat.st_mode & 07777);
 }
 
-// Replaces strFile with a changed copy. DirFd is its open directory. The copy is on stable storage
-// before it gets the file's name, so that a power cut leaves the old content or the new. Returns
-// the reason for a failure, else an empty string.
+// Returns the reason for a failure, else an empty string.
+std::string SyncDir(int DirFd) {
+  // EINVAL: this file system cannot sync a directory. That is no failure.
+  return fsync(DirFd) == 0 || errno == EINVAL ? "" : Reason("fsync of the directory");
+}
+
+// Replaces strFile with a changed copy, unless nothing changes. DirFd is its open directory. The
+// copy is on stable storage before it gets the file's name, so that a power cut leaves the old
+// content or the new. Returns the reason for a failure, else an empty string.
 std::string ReplaceFile(const std::string& strFile, const std::string& strDir, int DirFd,
                         const std::vector<Change>& Changes) {
   std::string strText;
@@ -163,14 +169,17 @@ std::string ReplaceFile(const std::string& strFile, const std::string& strDir, i
   if (Result != ReadResult::Read) {
     return Reason(Result);
   }
-  strText = ChangeLines(strText, Changes);
+  const std::string strNewText = ChangeLines(strText, Changes);
+  if (strNewText == strText) {
+    return SyncDir(DirFd);  // who has written this may have been killed before
+  }
   std::string strNew = strDir + TMP_NAME;
   const fileops::Descriptor New(fileops::CreateAnew(strNew.c_str()));
   if (New.Get() == -1) {
     return Reason("creation of a temporary file");
   }
   fileops::TmpFile NewName(std::move(strNew));  // a copy could fail and leave the file behind
-  if (fileops::WriteAll(New.Get(), strText.data(), strText.size()) != 0) {
+  if (fileops::WriteAll(New.Get(), strNewText.data(), strNewText.size()) != 0) {
     return Reason("copy");
   }
   if (SetOwnerAndMode(New.Get(), Stat) != 0) {
@@ -182,11 +191,7 @@ std::string ReplaceFile(const std::string& strFile, const std::string& strDir, i
   if (NewName.RenameTo(strFile.c_str()) != 0) {
     return Reason("rename");
   }
-  // EINVAL: this file system cannot sync a directory. That is no failure.
-  if (fsync(DirFd) != 0 && errno != EINVAL) {
-    return Reason("fsync of the directory");
-  }
-  return "";
+  return SyncDir(DirFd);
 }
 
 bool IsLink(const std::string& strFile) {
@@ -252,7 +257,7 @@ int ZAMOCFile::Save() {
     m_strError = "a change does not form one line";
   } else if (!m_strUnread.empty()) {
     m_strError = m_strUnread;
-  } else if (ChangeLines(m_strText, m_Changes) != m_strText) {
+  } else {
     m_strError = ChangeFile();
   }
   return m_strError.empty() ? 0 : -1;

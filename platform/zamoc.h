@@ -59,8 +59,8 @@ class ZAMOCFile {
   void Remove(const std::string& strKey);
 
   // Makes the noted changes in one replacement of the file: all of them or none. They apply to what
-  // the file contains now, under the lock. Leaves the file alone if they would not have changed it
-  // when it was read. If a key was noted twice, the later change counts.
+  // the file contains now, under the lock. Leaves the file alone if nothing would change. If a key
+  // was noted twice, the later change counts.
   //
   // Returns 0, or -1 on failure. The file is then unchanged, unless only the sync of the directory
   // after the replacement failed. It is a failure if a key, its value and its format do not form
