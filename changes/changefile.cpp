@@ -1,0 +1,426 @@
+#include "changefile.h"
+
+#include <fcntl.h>
+
+#include <algorithm>
+
+#include "fileops.h"
+#include "value.h"
+
+namespace {
+
+constexpr const char* APPLICATION_ID = "1414744131";  // "TSLC"
+constexpr const char* FORMAT = "1";
+// A statement that names a row before, after and now has at most 2000 columns.
+constexpr size_t MAX_COLUMNS = 600;
+
+// Large pages waste little. The file is worthless until it is complete, so nothing is synced.
+constexpr const char* SETTINGS =
+    "PRAGMA page_size = 32768; PRAGMA journal_mode = MEMORY; PRAGMA synchronous = OFF;"
+    "PRAGMA encoding = ";
+
+constexpr const char* TABLES =
+    "CREATE TABLE upgrade (version, tool, tool_version, time, database, inode, schema_version);"
+    "CREATE TABLE covered (number INTEGER PRIMARY KEY, name, keys, collations, columns, rowid_name,"
+    "  rowid_only, dangling, definition, reason, doubt);"
+    "CREATE TABLE file (name PRIMARY KEY, before, after);"
+    "PRAGMA application_id = ";
+
+// If only the recorder has the module of a virtual table (ncol is 0), the tables that hold its
+// content are known by their names alone.
+constexpr const char* OBJECTS = R"(
+  WITH definition AS (
+    SELECT 'before' AS side, name, sql FROM before.sqlite_schema WHERE type IN ('table', 'view')
+    UNION ALL
+    SELECT 'after', name, sql FROM after.sqlite_schema WHERE type IN ('table', 'view'))
+  SELECT name, max(wr), max(sql), CASE
+      WHEN count(*) = 1 THEN 'exists only ' || side || ' the upgrade'
+      WHEN min(sql) IS NOT max(sql) THEN 'the upgrade changes its definition'
+    END, CASE
+      WHEN type = 'view' THEN type
+      WHEN type = 'virtual' THEN 'virtual table'
+      WHEN name = 'sqlite_sequence' THEN 'an id is never given out twice'
+      WHEN name LIKE 'sqlite\_%' ESCAPE '\' THEN 'belongs to SQLite'
+    END, type = 'shadow' OR EXISTS (
+      SELECT 1 FROM pragma_table_list AS v WHERE v.type = 'virtual' AND v.ncol = 0
+      AND substr(name, 1, length(v.name) + 1) = v.name || '_' COLLATE NOCASE)
+  FROM definition JOIN pragma_table_list AS l USING (name) WHERE l.schema = side
+  GROUP BY name ORDER BY name)";
+
+struct Object {
+  ChangedTable Table;
+  bool blWithoutRowid;
+  bool blShadow;  // holds the content of a virtual table
+};
+
+bool IsName(const std::string& strA, const std::string& strB) {
+  return sqlite3_stricmp(strA.c_str(), strB.c_str()) == 0;
+}
+
+int Find(const std::vector<std::string>& Names, const std::string& strName) {
+  const auto Found = std::find_if(Names.begin(), Names.end(),
+                                  [&](const std::string& strIt) { return IsName(strIt, strName); });
+  return Found == Names.end() ? -1 : static_cast<int>(Found - Names.begin());
+}
+
+// --- What identifies a row ---
+
+std::vector<std::string> Strings(Statement&& Query, const std::string& strParameter) {
+  Query.Bind(1, strParameter);
+  std::vector<std::string> Result;
+  while (Query.Step()) {
+    Result.push_back(Query.Text(0));
+  }
+  return Result;
+}
+
+void ReadColumns(const Database& Db, ChangedTable* pTable) {
+  std::vector<std::string> All;
+  Statement Info(Db, "SELECT name, hidden FROM pragma_table_xinfo(?, 'before')");
+  Info.Bind(1, pTable->strName);
+  while (Info.Step()) {
+    All.push_back(Info.Text(0));
+    if (Info.Int(1) == 0) {
+      pTable->Columns.push_back(Info.Text(0));
+    }
+  }
+  if (All.size() > MAX_COLUMNS) {
+    throw SqlFailure(SQLITE_ERROR, "more than " + std::to_string(MAX_COLUMNS) + " columns");
+  }
+  for (const char* szName : {"oid", "_rowid_", "rowid"}) {
+    if (Find(All, szName) == -1) {
+      pTable->strRowid = szName;
+    }
+  }
+}
+
+bool HasNull(const Database& Db, const ChangedTable& Table, const std::string& strSide) {
+  std::string strSql = "SELECT 1 FROM " + strSide + "." + Quoted(Table.strName) + " WHERE 0";
+  for (const std::string& strKey : Table.Keys) {
+    strSql += " OR " + Quoted(strKey) + " IS NULL";
+  }
+  return Statement(Db, strSql).Step();
+}
+
+// Returns the name of the index of the primary key, or "". The key of a table with a rowid may hold
+// NULL, even twice; then only the rowid identifies a row.
+std::string ReadKeys(const Database& Db, const Object& Object, ChangedTable* pTable) {
+  const std::vector<std::string> Index = Strings(
+      {Db, "SELECT name FROM pragma_index_list(?, 'before') WHERE origin = 'pk'"}, pTable->strName);
+  if (Index.empty()) {
+    pTable->Keys =
+        Strings({Db, "SELECT name FROM pragma_table_info(?, 'before') WHERE pk"}, pTable->strName);
+    pTable->Collations = {"BINARY"};
+    if (!pTable->Keys.empty()) {
+      pTable->strRowid = pTable->Keys[0];
+      return "";
+    }
+  } else {
+    const std::string strInfo = " FROM pragma_index_xinfo(?, 'before') WHERE key";
+    pTable->Keys = Strings({Db, "SELECT name" + strInfo}, Index[0]);
+    pTable->Collations = Strings({Db, "SELECT coll" + strInfo}, Index[0]);
+    if (Object.blWithoutRowid) {
+      pTable->strRowid.clear();
+      return "";
+    }
+    if (!HasNull(Db, *pTable, "before") && !HasNull(Db, *pTable, "after")) {
+      return Index[0];
+    }
+  }
+  if (pTable->strRowid.empty()) {
+    throw SqlFailure(SQLITE_ERROR, "columns hide every name of its rowid");
+  }
+  pTable->blRowidOnly = true;
+  pTable->Keys = {pTable->strRowid};
+  pTable->Collations = {"BINARY"};
+  return "";
+}
+
+// --- Rows that differ ---
+
+std::string SameRow(const ChangedTable& Table, const std::string& strA, const std::string& strB) {
+  std::string strSql = "1";
+  for (const std::string& strColumn : Table.Columns) {
+    strSql +=
+        " AND (" + SameValue(strA + "." + Quoted(strColumn), strB + "." + Quoted(strColumn)) + ")";
+  }
+  return strSql;
+}
+
+std::string SameNamedKeys(const ChangedTable& Table) {
+  std::string strSql = "1";
+  for (size_t Key = 0; Key < Table.Keys.size(); ++Key) {
+    const std::string strKey = "." + Quoted(Table.Keys[Key]);
+    strSql += " AND u" + strKey + " = t" + strKey;
+    strSql += " COLLATE " + Quoted(Table.Collations[Key]);
+  }
+  return strSql;
+}
+
+// Fills before_N and after_N. Indexes other than the primary key's are not used: they may need what
+// only the recorder has.
+void StoreRows(const Database& Db, const ChangedTable& Table, const std::string& strIndex) {
+  const std::string strNumber = std::to_string(Table.Number);
+  const std::string strBefore = "before_" + strNumber;
+  const std::string strAfter = "after_" + strNumber;
+  const std::string strKeys = Numbered("k", Table.Keys.size());
+  const std::string strColumns = Numbered("c", Table.Columns.size());
+  const std::string strByKey =
+      strIndex.empty() ? " AS u NOT INDEXED" : " AS u INDEXED BY " + Quoted(strIndex);
+  // A single number is stored as the rowid, not twice.
+  const bool blNumber = Table.Keys.size() == 1 && Table.Keys[0] == Table.strRowid;
+  const std::string strDefinition = blNumber
+                                        ? "k0 INTEGER PRIMARY KEY" + strColumns + ", r)"
+                                        : strKeys.substr(2) + strColumns + ", r, PRIMARY KEY (" +
+                                              strKeys.substr(2) + ")) WITHOUT ROWID";
+  Db.Execute("CREATE TABLE " + strBefore + " (" + strDefinition);
+  Db.Execute("CREATE TABLE " + strAfter + " (" + strDefinition);
+  const std::string strName = "." + Quoted(Table.strName);
+  const auto Row = [&](const std::string& strRow) {
+    const bool blRowid = !Table.strRowid.empty() && !blNumber;
+    return Named(strRow, Table.Columns) +
+           (blRowid ? ", " + strRow + "." + Quoted(Table.strRowid) : ", NULL");
+  };
+  Db.Execute("INSERT INTO " + strBefore + " SELECT " + Named("t", Table.Keys).substr(2) + Row("t") +
+             " FROM before" + strName + " AS t NOT INDEXED WHERE NOT EXISTS (SELECT 1 FROM after" +
+             strName + strByKey + " WHERE " + SameNamedKeys(Table) + " AND " +
+             SameRow(Table, "u", "t") + ")");
+  Db.Execute("INSERT INTO " + strAfter + " SELECT " + Numbered("b.k", Table.Keys.size()).substr(2) +
+             Row("u") + " FROM " + strBefore + " AS b CROSS JOIN after" + strName + strByKey +
+             " WHERE " + SameKeys(Table, "u", "b"));
+  Db.Execute("INSERT INTO " + strAfter + " SELECT " + Named("t", Table.Keys).substr(2) + Row("t") +
+             " FROM after" + strName + " AS t NOT INDEXED WHERE NOT EXISTS (SELECT 1 FROM before" +
+             strName + strByKey + " WHERE " + SameNamedKeys(Table) + ")");
+}
+
+bool HasChanges(const Database& Db, const ChangedTable& Table) {
+  const std::string strNumber = std::to_string(Table.Number);
+  return Statement(Db, "SELECT 1 FROM before_" + strNumber + " UNION ALL SELECT 1 FROM after_" +
+                           strNumber)
+      .Step();
+}
+
+bool IsDangling(const Database& Db, const ChangedTable& Table) {
+  try {
+    Statement Check(Db, "SELECT 1 FROM pragma_foreign_key_check(?, 'before')");
+    Check.Bind(1, Table.strName);
+    return Check.Step();
+  } catch (const SqlFailure& Reason) {
+    if (Reason.Code() != SQLITE_ERROR) {
+      throw;
+    }
+    return true;  // the columns that it refers to are not unique
+  }
+}
+
+void DropRows(const Database& Db, const ChangedTable& Table) {
+  for (const char* szTable : {"before_", "after_"}) {
+    Db.Execute("DROP TABLE IF EXISTS " + (szTable + std::to_string(Table.Number)));
+  }
+}
+
+void Compare(const Database& Db, const Object& Object, ChangedTable* pTable) {
+  try {
+    ReadColumns(Db, pTable);
+    const std::string strIndex = ReadKeys(Db, Object, pTable);
+    StoreRows(Db, *pTable, strIndex);
+    pTable->blDangling = HasChanges(Db, *pTable) && IsDangling(Db, *pTable);
+    if (Object.blShadow) {
+      pTable->blDoubt = HasChanges(Db, *pTable);
+      pTable->strReason = "holds the content of a virtual table";
+    }
+  } catch (const SqlFailure& Reason) {
+    // Such as a collation that only the recorder has.
+    if (Reason.Code() != SQLITE_ERROR) {
+      throw;
+    }
+    pTable->strReason = Reason.what();
+    pTable->blDoubt = true;
+  }
+  if (!pTable->strReason.empty()) {
+    DropRows(Db, *pTable);
+  }
+}
+
+// --- The other tables ---
+
+std::vector<Object> ListObjects(const Database& Db) {
+  Statement List(Db, OBJECTS);
+  std::vector<Object> Objects;
+  while (List.Step()) {
+    Object Next = {{}, List.Int(1) != 0, List.Int(5) != 0};
+    Next.Table.Number = static_cast<int>(Objects.size());
+    Next.Table.strName = List.Text(0);
+    Next.Table.strDefinition = List.Text(2);
+    Next.Table.blDoubt = !List.Text(3).empty();
+    Next.Table.strReason = Next.Table.blDoubt ? List.Text(3) : List.Text(4);
+    Objects.push_back(Next);
+  }
+  return Objects;
+}
+
+std::string JsonArray(const Database& Db, const std::vector<std::string>& Strings) {
+  std::string strArray = "[]";
+  Statement Append(Db, "SELECT json_insert(?, '$[#]', ?)");
+  for (const std::string& strString : Strings) {
+    Append.Bind(1, strArray);
+    Append.Bind(2, strString);
+    Append.Step();
+    strArray = Append.Text(0);
+  }
+  return strArray;
+}
+
+void StoreTable(const Database& Db, const ChangedTable& Table) {
+  Statement Insert(Db, "INSERT INTO covered VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?)");
+  Insert.Bind(1, int64_t{Table.Number});
+  Insert.Bind(2, Table.strName);
+  Insert.Bind(3, JsonArray(Db, Table.Keys));
+  Insert.Bind(4, JsonArray(Db, Table.Collations));
+  Insert.Bind(5, JsonArray(Db, Table.Columns));
+  Insert.Bind(6, Table.strRowid);
+  Insert.Bind(7, int64_t{Table.blRowidOnly});
+  Insert.Bind(8, int64_t{Table.blDangling});
+  Insert.Bind(9, Table.strDefinition);
+  Insert.Bind(10, Table.strReason);
+  Insert.Bind(11, int64_t{Table.blDoubt});
+  Insert.Step();
+}
+
+void StoreUpgrade(const Database& Db, const Upgrade& Info) {
+  Statement Insert(Db, "INSERT INTO upgrade VALUES (?, ?, ?, ?, ?, ?, ?)");
+  Insert.Bind(1, Info.strVersion);
+  Insert.Bind(2, Info.strTool);
+  Insert.Bind(3, Info.strToolVersion);
+  Insert.Bind(4, Info.strTime);
+  Insert.Bind(5, Info.strDatabase);
+  Insert.Bind(6, Info.Inode);
+  Insert.Bind(7, Info.SchemaVersion);
+  Insert.Step();
+}
+
+}  // namespace
+
+void MakeChangeFile(const std::string& strFile, const std::string& strBefore,
+                    const std::string& strAfter, const Upgrade& Info) {
+  // SQLite would create it with a mode that others can read.
+  if (fileops::Descriptor(open(strFile.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600))
+          .Get() == -1) {
+    throw SystemFailure("cannot create " + strFile);
+  }
+  const std::string strEncoding =
+      Database(strBefore, SQLITE_OPEN_READWRITE).Text("PRAGMA encoding");
+  Database Db(strFile, SQLITE_OPEN_READWRITE);
+  Db.Execute(SETTINGS + Quoted(strEncoding));
+  Db.Attach(strBefore, "before");
+  Db.Attach(strAfter, "after");
+  Db.Execute(std::string("BEGIN;") + TABLES + APPLICATION_ID + "; PRAGMA user_version = " + FORMAT);
+  StoreUpgrade(Db, Info);
+  for (Object& Object : ListObjects(Db)) {
+    if (Object.Table.strReason.empty()) {
+      Compare(Db, Object, &Object.Table);
+    }
+    StoreTable(Db, Object.Table);
+  }
+  Db.Execute("COMMIT");
+}
+
+void AddFile(const Database& Changes, const std::string& strName,
+             std::optional<std::string_view> Before, std::optional<std::string_view> After) {
+  Statement Insert(Changes, "INSERT INTO file VALUES (?, ?, ?)");
+  Insert.Bind(1, strName);
+  Insert.BindBlob(2, Before);
+  Insert.BindBlob(3, After);
+  Insert.Step();
+}
+
+Upgrade ReadUpgrade(const Database& Changes) {
+  const char* szFile = sqlite3_db_filename(Changes.Get(), "main");
+  if (Changes.Text("PRAGMA application_id") != APPLICATION_ID) {
+    throw Failure(szFile + std::string(" is not a change file"));
+  }
+  if (Changes.Text("PRAGMA user_version") != FORMAT) {
+    throw Failure(szFile + std::string(" has the format of another version"));
+  }
+  Statement Read(Changes, "SELECT * FROM upgrade");
+  if (!Read.Step()) {
+    throw Failure(szFile + std::string(" is not complete"));
+  }
+  return {Read.Text(0), Read.Text(1), Read.Text(2), Read.Text(3),
+          Read.Text(4), Read.Int(5),  Read.Int(6)};
+}
+
+std::vector<ChangedTable> ReadTables(const Database& Changes) {
+  ReadUpgrade(Changes);
+  const auto List = [&](const std::string& strArray) {
+    return Strings({Changes, "SELECT value FROM json_each(?)"}, strArray);
+  };
+  Statement Read(Changes, "SELECT * FROM covered ORDER BY number");
+  std::vector<ChangedTable> Tables;
+  while (Read.Step()) {
+    ChangedTable Table;
+    Table.Number = static_cast<int>(Read.Int(0));
+    Table.strName = Read.Text(1);
+    Table.Keys = List(Read.Text(2));
+    Table.Collations = List(Read.Text(3));
+    Table.Columns = List(Read.Text(4));
+    Table.strRowid = Read.Text(5);
+    Table.blRowidOnly = Read.Int(6) != 0;
+    Table.blDangling = Read.Int(7) != 0;
+    Table.strDefinition = Read.Text(8);
+    Table.strReason = Read.Text(9);
+    Table.blDoubt = Read.Int(10) != 0;
+    if (IsName(Table.strName, "camera")) {
+      Table.Vendor = Find(Table.Columns, "vendor");
+      Table.Model = Find(Table.Columns, "model");
+    }
+    Tables.push_back(Table);
+  }
+  return Tables;
+}
+
+std::string RowName(const ChangedTable& Table, const Statement& Row, int FirstKey,
+                    int FirstColumn) {
+  std::string strName = Name(Table.strName);
+  for (size_t Key = 0; Key < Table.Keys.size(); ++Key) {
+    strName += (Key == 0 ? " " : ", ") + Shown(Row.Value(FirstKey + static_cast<int>(Key)));
+  }
+  if (Table.Vendor == -1 || Table.Model == -1) {
+    return strName;
+  }
+  return strName + " (" + Plain(Row.Value(FirstColumn + Table.Vendor)) + " " +
+         Plain(Row.Value(FirstColumn + Table.Model)) + ")";
+}
+
+// --- SQL ---
+
+std::string Numbered(const std::string& strPrefix, size_t Count) {
+  std::string strSql;
+  for (size_t Number = 0; Number < Count; ++Number) {
+    strSql += ", " + strPrefix + std::to_string(Number);
+  }
+  return strSql;
+}
+
+std::string Named(const std::string& strRow, const std::vector<std::string>& Names) {
+  std::string strSql;
+  for (const std::string& strName : Names) {
+    strSql += ", " + strRow + "." + Quoted(strName);
+  }
+  return strSql;
+}
+
+std::string SameValue(const std::string& strA, const std::string& strB) {
+  return strA + " IS " + strB + " COLLATE BINARY AND same_type(" + strA + ", " + strB + ")";
+}
+
+std::string SameKeys(const ChangedTable& Table, const std::string& strRow,
+                     const std::string& strChange) {
+  std::string strSql = "1";
+  for (size_t Key = 0; Key < Table.Keys.size(); ++Key) {
+    strSql += " AND " + strRow + "." + Quoted(Table.Keys[Key]);
+    strSql += " = " + strChange + ".k" + std::to_string(Key);
+    strSql += " COLLATE " + Quoted(Table.Collations[Key]);
+  }
+  return strSql;
+}

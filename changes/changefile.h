@@ -1,0 +1,89 @@
+// The change file: an SQLite database that holds what an upgrade changes, in the encoding of the
+// recorder's database. Values are stored as they are there, and never become SQL text.
+//
+//   upgrade    one row: what was upgraded, by what
+//   covered    a row a table or view of the database: how its rows are stored, or why they are not
+//   before_N   the rows of table N that the upgrade changes or removes, as they are before
+//   after_N    the rows that it changes or adds, as they are afterwards
+//   file       a row a capability file that it changes: name, before, after (NULL: no such file)
+//
+// The columns of before_N and after_N are k0, k1, ... for the keys and c0, c1, ... for the columns
+// of the table, declared without a type, so that no value is converted. A changed row has the same
+// keys in both. In before_N the column r follows, the rowid; it is NULL if the table has none.
+//
+// Two values are the same if SQLite compares them as equal, text byte by byte, and their types are
+// the same. So 0.0 and -0.0 are the same.
+//
+// All functions throw Failure.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "database.h"
+
+struct Upgrade {
+  std::string strVersion;  // of the package that is replaced
+  std::string strTool;     // the program
+  std::string strToolVersion;
+  std::string strTime;
+  std::string strDatabase;    // the recorder's database, without links
+  int64_t Inode = 0;          // of that file
+  int64_t SchemaVersion = 0;  // PRAGMA schema_version of that database; each VACUUM changes it
+};
+
+struct ChangedTable {
+  int Number = 0;
+  std::string strName;
+  std::vector<std::string> Keys;        // columns that identify a row, or a name of the rowid
+  std::vector<std::string> Collations;  // of the keys
+  std::vector<std::string> Columns;     // those that are not generated, in order
+  std::string strRowid;                 // a name of the rowid; empty if there is none to use
+  bool blRowidOnly = false;  // nothing but the rowid identifies a row; VACUUM may change it
+  // The table has had rows whose foreign keys lead nowhere, or its foreign keys cannot be checked.
+  bool blDangling = false;
+  std::string strDefinition;  // its CREATE statement
+  // Why the table is not covered: then there are no before_N and after_N. Empty if it is covered.
+  std::string strReason;
+  bool blDoubt = false;  // not covered, although the upgrade changes it or nobody can tell
+  // A row of the recorder's cameras has these columns, counted from 0. In other tables: -1.
+  int Vendor = -1;
+  int Model = -1;
+};
+
+// Creates strFile (mode 0600) from the databases before and after. All names are absolute. The file
+// is not synced.
+void MakeChangeFile(const std::string& strFile, const std::string& strBefore,
+                    const std::string& strAfter, const Upgrade& Info);
+
+// Adds a capability file to the change file. No content means that there is no such file. Does not
+// copy the contents.
+void AddFile(const Database& Changes, const std::string& strName,
+             std::optional<std::string_view> Before, std::optional<std::string_view> After);
+
+// Read the change file that is open as Changes. They refuse another file, and another format.
+Upgrade ReadUpgrade(const Database& Changes);
+std::vector<ChangedTable> ReadTables(const Database& Changes);
+
+// Names a row, such as "camera 12 (VENDOR MODEL)" or "TABLE 'a', 2". The statement's row has all
+// keys from column FirstKey on and all columns of the table from FirstColumn on.
+std::string RowName(const ChangedTable& Table, const Statement& Row, int FirstKey, int FirstColumn);
+
+// --- SQL ---
+
+// ", x0, x1, ..." with strPrefix in the place of x.
+std::string Numbered(const std::string& strPrefix, size_t Count);
+
+// The columns Names of the row strRow: ", t."a", t."b", ...".
+std::string Named(const std::string& strRow, const std::vector<std::string>& Names);
+
+// True if two expressions have the same value.
+std::string SameValue(const std::string& strA, const std::string& strB);
+
+// True if the row strRow of the table has the keys k0, k1, ... of strChange, a row of the change
+// file.
+std::string SameKeys(const ChangedTable& Table, const std::string& strRow,
+                     const std::string& strChange);

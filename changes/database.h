@@ -1,0 +1,74 @@
+// SQLite connections and statements that free themselves and throw.
+#pragma once
+
+#include <sqlite3.h>
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "failure.h"
+
+// An error of SQLite: its message and result code.
+class SqlFailure : public Failure {
+ public:
+  SqlFailure(int Code, const std::string& strWhat) : Failure(strWhat), m_Code(Code) {}
+  // The primary result code.
+  int Code() const { return m_Code & 0xff; }
+
+ private:
+  int m_Code;
+};
+
+// A connection, for one thread. Nothing that a database says acts on its own: there are no
+// triggers, views or foreign keys, its schema calls only harmless functions, and only Attach()
+// opens another file. Waits up to five seconds for a lock. All functions throw SqlFailure.
+class Database {
+ public:
+  // strName is an absolute path, since SQLite takes "file:..." for a URI, or "" for a temporary
+  // database. Flags are those of sqlite3_open_v2.
+  Database(const std::string& strName, int Flags);
+  ~Database() { sqlite3_close(m_pDb); }
+  Database(const Database&) = delete;
+  Database& operator=(const Database&) = delete;
+  sqlite3* Get() const { return m_pDb; }
+  void Attach(const std::string& strFile, const std::string& strSchema);
+  void Execute(const std::string& strSql) const;
+  // Returns the first column of the first row; "" if there is no row.
+  std::string Text(const std::string& strSql) const;
+  [[noreturn]] void Throw(int Code) const;
+
+ private:
+  sqlite3* m_pDb = nullptr;
+};
+
+class Statement {
+ public:
+  Statement(const Database& Db, const std::string& strSql);
+  ~Statement() { sqlite3_finalize(m_pStatement); }
+  Statement(const Statement&) = delete;
+  Statement& operator=(const Statement&) = delete;
+  sqlite3_stmt* Get() const { return m_pStatement; }
+  // Each Bind first resets the statement. The text is copied.
+  void Bind(int Parameter, const std::string& strText);
+  void Bind(int Parameter, int64_t Number);
+  // Does not copy the bytes: they must live until the statement is run. No bytes bind NULL.
+  void BindBlob(int Parameter, std::optional<std::string_view> Bytes);
+  // Goes to the next row. Returns false if there is none.
+  bool Step();
+  // Returns a column of the row; "" for NULL.
+  std::string Text(int Column) const;
+  int64_t Int(int Column) const { return sqlite3_column_int64(m_pStatement, Column); }
+  // The value lives until the next step.
+  sqlite3_value* Value(int Column) const { return sqlite3_column_value(m_pStatement, Column); }
+
+ private:
+  void Check(int Code) const;
+
+  const Database& m_Db;
+  sqlite3_stmt* m_pStatement = nullptr;
+};
+
+// Returns an identifier in double quotes.
+std::string Quoted(const std::string& strName);
