@@ -138,59 +138,41 @@ std::string ReadKeys(const Database& Db, const Object& Object, ChangedTable* pTa
 
 // --- Rows that differ ---
 
-std::string SameRow(const ChangedTable& Table, const std::string& strA, const std::string& strB) {
-  std::string strSql = "1";
-  for (const std::string& strColumn : Table.Columns) {
-    strSql +=
-        " AND (" + SameValue(strA + "." + Quoted(strColumn), strB + "." + Quoted(strColumn)) + ")";
-  }
-  return strSql;
-}
-
-std::string SameNamedKeys(const ChangedTable& Table) {
-  std::string strSql = "1";
-  for (size_t Key = 0; Key < Table.Keys.size(); ++Key) {
-    const std::string strKey = "." + Quoted(Table.Keys[Key]);
-    strSql += " AND u" + strKey + " = t" + strKey;
-    strSql += " COLLATE " + Quoted(Table.Collations[Key]);
-  }
-  return strSql;
-}
-
-// Fills before_N and after_N. Indexes other than the primary key's are not used: they may need what
-// only the recorder has.
+// Fills before_N and after_N. A single number is stored as the rowid, not twice. Indexes other than
+// the primary key's are not used: they may need what only the recorder has.
 void StoreRows(const Database& Db, const ChangedTable& Table, const std::string& strIndex) {
-  const std::string strNumber = std::to_string(Table.Number);
-  const std::string strBefore = "before_" + strNumber;
-  const std::string strAfter = "after_" + strNumber;
-  const std::string strKeys = Numbered("k", Table.Keys.size());
-  const std::string strColumns = Numbered("c", Table.Columns.size());
-  const std::string strByKey =
-      strIndex.empty() ? " AS u NOT INDEXED" : " AS u INDEXED BY " + Quoted(strIndex);
-  // A single number is stored as the rowid, not twice.
   const bool blNumber = Table.Keys.size() == 1 && Table.Keys[0] == Table.strRowid;
-  const std::string strDefinition = blNumber
-                                        ? "k0 INTEGER PRIMARY KEY" + strColumns + ", r)"
-                                        : strKeys.substr(2) + strColumns + ", r, PRIMARY KEY (" +
-                                              strKeys.substr(2) + ")) WITHOUT ROWID";
-  Db.Execute("CREATE TABLE " + strBefore + " (" + strDefinition);
-  Db.Execute("CREATE TABLE " + strAfter + " (" + strDefinition);
-  const std::string strName = "." + Quoted(Table.strName);
-  const auto Row = [&](const std::string& strRow) {
-    const bool blRowid = !Table.strRowid.empty() && !blNumber;
-    return Named(strRow, Table.Columns) +
-           (blRowid ? ", " + strRow + "." + Quoted(Table.strRowid) : ", NULL");
+  const std::string strKeys = Numbered("k", Table.Keys);
+  const bool blRowid = !blNumber && !Table.strRowid.empty();
+  const WordMap Words = {
+      {"n", std::to_string(Table.Number)},
+      {"table", Quoted(Table.strName)},
+      {"stored", (blNumber ? "k0 INTEGER PRIMARY KEY, " : strKeys + ", ") +
+                     Numbered("c", Table.Columns) +
+                     (blNumber ? ", r)" : ", r, PRIMARY KEY (" + strKeys + ")) WITHOUT ROWID")},
+      {"keys", ForEach(Table.Keys, "t.{name}", ", ")},
+      {"row", ForEach(Table.Columns, "t.{name}, ", "") +
+                  (blRowid ? "t." + Quoted(Table.strRowid) : "NULL")},
+      {"by_key", strIndex.empty() ? "NOT INDEXED" : "INDEXED BY " + Quoted(strIndex)},
+      {"same_keys", SameKeys(Table, "u", "t.{name}")},
+      {"same_row", ForEach(Table.Columns, "(" + SameValue("u.{name}", "t.{name}") + ")", " AND ")},
+      {"keys_before", Numbered("b.k", Table.Keys)},
+      {"same_keys_before", SameKeys(Table, "t", "b.k{i}")},
   };
-  Db.Execute("INSERT INTO " + strBefore + " SELECT " + Named("t", Table.Keys).substr(2) + Row("t") +
-             " FROM before" + strName + " AS t NOT INDEXED WHERE NOT EXISTS (SELECT 1 FROM after" +
-             strName + strByKey + " WHERE " + SameNamedKeys(Table) + " AND " +
-             SameRow(Table, "u", "t") + ")");
-  Db.Execute("INSERT INTO " + strAfter + " SELECT " + Numbered("b.k", Table.Keys.size()).substr(2) +
-             Row("u") + " FROM " + strBefore + " AS b CROSS JOIN after" + strName + strByKey +
-             " WHERE " + SameKeys(Table, "u", "b"));
-  Db.Execute("INSERT INTO " + strAfter + " SELECT " + Named("t", Table.Keys).substr(2) + Row("t") +
-             " FROM after" + strName + " AS t NOT INDEXED WHERE NOT EXISTS (SELECT 1 FROM before" +
-             strName + strByKey + " WHERE " + SameNamedKeys(Table) + ")");
+  for (const char* szSql : {
+           "CREATE TABLE before_{n} ({stored}",
+           "CREATE TABLE after_{n} ({stored}",
+           R"(INSERT INTO before_{n} SELECT {keys}, {row} FROM before.{table} AS t NOT INDEXED
+                WHERE NOT EXISTS (SELECT 1 FROM after.{table} AS u {by_key}
+                                  WHERE {same_keys} AND {same_row}))",
+           R"(INSERT INTO after_{n} SELECT {keys_before}, {row}
+                FROM before_{n} AS b CROSS JOIN after.{table} AS t {by_key}
+                WHERE {same_keys_before})",
+           R"(INSERT INTO after_{n} SELECT {keys}, {row} FROM after.{table} AS t NOT INDEXED
+                WHERE NOT EXISTS (SELECT 1 FROM before.{table} AS u {by_key} WHERE {same_keys}))",
+       }) {
+    Db.Execute(Fill(szSql, Words));
+  }
 }
 
 bool HasChanges(const Database& Db, const ChangedTable& Table) {
@@ -394,33 +376,18 @@ std::string RowName(const ChangedTable& Table, const Statement& Row, int FirstKe
 
 // --- SQL ---
 
-std::string Numbered(const std::string& strPrefix, size_t Count) {
-  std::string strSql;
-  for (size_t Number = 0; Number < Count; ++Number) {
-    strSql += ", " + strPrefix + std::to_string(Number);
-  }
-  return strSql;
-}
-
-std::string Named(const std::string& strRow, const std::vector<std::string>& Names) {
-  std::string strSql;
-  for (const std::string& strName : Names) {
-    strSql += ", " + strRow + "." + Quoted(strName);
-  }
-  return strSql;
-}
-
-std::string SameValue(const std::string& strA, const std::string& strB) {
-  return strA + " IS " + strB + " COLLATE BINARY AND same_type(" + strA + ", " + strB + ")";
+std::string Numbered(const std::string& strPrefix, const std::vector<std::string>& Names) {
+  return ForEach(Names, strPrefix + "{i}", ", ");
 }
 
 std::string SameKeys(const ChangedTable& Table, const std::string& strRow,
-                     const std::string& strChange) {
+                     const std::string& strKey) {
+  const std::string strSame = " AND " + strRow + ".{name} = " + strKey + " COLLATE ";
   std::string strSql = "1";
   for (size_t Key = 0; Key < Table.Keys.size(); ++Key) {
-    strSql += " AND " + strRow + "." + Quoted(Table.Keys[Key]);
-    strSql += " = " + strChange + ".k" + std::to_string(Key);
-    strSql += " COLLATE " + Quoted(Table.Collations[Key]);
+    const std::string strName = Quoted(Table.Keys[Key]);
+    strSql += Fill(strSame, {{"name", strName}, {"i", std::to_string(Key)}});
+    strSql += Quoted(Table.Collations[Key]);
   }
   return strSql;
 }

@@ -24,6 +24,7 @@
 #include <vector>
 
 #include "database.h"
+#include "sqltext.h"
 
 struct Upgrade {
   std::string strVersion;  // of the package that is replaced
@@ -74,16 +75,10 @@ std::string RowName(const ChangedTable& Table, const Statement& Row, int FirstKe
 
 // --- SQL ---
 
-// ", x0, x1, ..." with strPrefix in the place of x.
-std::string Numbered(const std::string& strPrefix, size_t Count);
+// "x0, x1, ...", one for each name, with strPrefix in the place of x.
+std::string Numbered(const std::string& strPrefix, const std::vector<std::string>& Names);
 
-// The columns Names of the row strRow: ", t."a", t."b", ...".
-std::string Named(const std::string& strRow, const std::vector<std::string>& Names);
-
-// True if two expressions have the same value.
-std::string SameValue(const std::string& strA, const std::string& strB);
-
-// True if the row strRow of the table has the keys k0, k1, ... of strChange, a row of the change
-// file.
+// True if the row strRow of the table has these keys. strKey stands for each of them, as a pattern
+// of ForEach: "b.k{i}" for a row b of the change file, "t.{name}" for another row of the table.
 std::string SameKeys(const ChangedTable& Table, const std::string& strRow,
-                     const std::string& strChange);
+                     const std::string& strKey);

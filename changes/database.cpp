@@ -1,5 +1,7 @@
 #include "database.h"
 
+#include "sqltext.h"
+
 namespace {
 
 constexpr int BUSY_TIMEOUT_MSEC = 5000;
@@ -99,12 +101,4 @@ std::string Statement::Text(int Column) const {
   const auto* pText = reinterpret_cast<const char*>(sqlite3_column_text(m_pStatement, Column));
   const auto Len = static_cast<size_t>(sqlite3_column_bytes(m_pStatement, Column));
   return pText == nullptr ? "" : std::string(pText, Len);
-}
-
-std::string Quoted(const std::string& strName) {
-  std::string strQuoted = "\"";
-  for (const char Char : strName) {
-    strQuoted.append(Char == '"' ? 2 : 1, Char);
-  }
-  return strQuoted + '"';
 }

@@ -69,6 +69,3 @@ class Statement {
   const Database& m_Db;
   sqlite3_stmt* m_pStatement = nullptr;
 };
-
-// Returns an identifier in double quotes.
-std::string Quoted(const std::string& strName);
