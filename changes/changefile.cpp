@@ -11,8 +11,8 @@ namespace {
 
 constexpr const char* APPLICATION_ID = "1414744131";  // "TSLC"
 constexpr const char* FORMAT = "1";
-// A statement that names a row before, after and now has at most 2000 columns.
-constexpr size_t MAX_COLUMNS = 600;
+// A statement names the keys and columns of a row before, after and now: SQLite allows 2000.
+constexpr size_t MAX_COLUMNS = 480;
 
 // Large pages waste little. The file is worthless until it is complete, so nothing is synced.
 constexpr const char* SETTINGS =
@@ -22,7 +22,8 @@ constexpr const char* SETTINGS =
 constexpr const char* TABLES =
     "CREATE TABLE upgrade (version, tool, tool_version, time, database, inode, schema_version);"
     "CREATE TABLE covered (number INTEGER PRIMARY KEY, name, keys, collations, columns, rowid_name,"
-    "  rowid_only, dangling, definition, reason, doubt);"
+    "  rowid_only, definition, reason, doubt);"
+    "CREATE TABLE dangling (child, row, parent, id, count);"
     "CREATE TABLE file (name PRIMARY KEY, before, after);"
     "PRAGMA application_id = ";
 
@@ -47,21 +48,15 @@ constexpr const char* OBJECTS = R"(
   FROM definition JOIN pragma_table_list AS l USING (name) WHERE l.schema = side
   GROUP BY name ORDER BY name)";
 
+constexpr const char* DANGLING = R"(
+  INSERT INTO {list} SELECT "table", rowid, parent, fkid, count(*)
+  FROM pragma_foreign_key_check(?, '{schema}') GROUP BY 1, 2, 3, 4)";
+
 struct Object {
   ChangedTable Table;
   bool blWithoutRowid;
   bool blShadow;  // holds the content of a virtual table
 };
-
-bool IsName(const std::string& strA, const std::string& strB) {
-  return sqlite3_stricmp(strA.c_str(), strB.c_str()) == 0;
-}
-
-int Find(const std::vector<std::string>& Names, const std::string& strName) {
-  const auto Found = std::find_if(Names.begin(), Names.end(),
-                                  [&](const std::string& strIt) { return IsName(strIt, strName); });
-  return Found == Names.end() ? -1 : static_cast<int>(Found - Names.begin());
-}
 
 // --- What identifies a row ---
 
@@ -88,7 +83,7 @@ void ReadColumns(const Database& Db, ChangedTable* pTable) {
     throw SqlFailure(SQLITE_ERROR, "more than " + std::to_string(MAX_COLUMNS) + " columns");
   }
   for (const char* szName : {"oid", "_rowid_", "rowid"}) {
-    if (Find(All, szName) == -1) {
+    if (FindName(All, szName) == -1) {
       pTable->strRowid = szName;
     }
   }
@@ -182,19 +177,6 @@ bool HasChanges(const Database& Db, const ChangedTable& Table) {
       .Step();
 }
 
-bool IsDangling(const Database& Db, const ChangedTable& Table) {
-  try {
-    Statement Check(Db, "SELECT 1 FROM pragma_foreign_key_check(?, 'before')");
-    Check.Bind(1, Table.strName);
-    return Check.Step();
-  } catch (const SqlFailure& Reason) {
-    if (Reason.Code() != SQLITE_ERROR) {
-      throw;
-    }
-    return true;  // the columns that it refers to are not unique
-  }
-}
-
 void DropRows(const Database& Db, const ChangedTable& Table) {
   for (const char* szTable : {"before_", "after_"}) {
     Db.Execute("DROP TABLE IF EXISTS " + (szTable + std::to_string(Table.Number)));
@@ -206,7 +188,6 @@ void Compare(const Database& Db, const Object& Object, ChangedTable* pTable) {
     ReadColumns(Db, pTable);
     const std::string strIndex = ReadKeys(Db, Object, pTable);
     StoreRows(Db, *pTable, strIndex);
-    pTable->blDangling = HasChanges(Db, *pTable) && IsDangling(Db, *pTable);
     if (Object.blShadow) {
       pTable->blDoubt = HasChanges(Db, *pTable);
       pTable->strReason = "holds the content of a virtual table";
@@ -253,34 +234,6 @@ std::string JsonArray(const Database& Db, const std::vector<std::string>& String
   return strArray;
 }
 
-void StoreTable(const Database& Db, const ChangedTable& Table) {
-  Statement Insert(Db, "INSERT INTO covered VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?)");
-  Insert.Bind(1, int64_t{Table.Number});
-  Insert.Bind(2, Table.strName);
-  Insert.Bind(3, JsonArray(Db, Table.Keys));
-  Insert.Bind(4, JsonArray(Db, Table.Collations));
-  Insert.Bind(5, JsonArray(Db, Table.Columns));
-  Insert.Bind(6, Table.strRowid);
-  Insert.Bind(7, int64_t{Table.blRowidOnly});
-  Insert.Bind(8, int64_t{Table.blDangling});
-  Insert.Bind(9, Table.strDefinition);
-  Insert.Bind(10, Table.strReason);
-  Insert.Bind(11, int64_t{Table.blDoubt});
-  Insert.Step();
-}
-
-void StoreUpgrade(const Database& Db, const Upgrade& Info) {
-  Statement Insert(Db, "INSERT INTO upgrade VALUES (?, ?, ?, ?, ?, ?, ?)");
-  Insert.Bind(1, Info.strVersion);
-  Insert.Bind(2, Info.strTool);
-  Insert.Bind(3, Info.strToolVersion);
-  Insert.Bind(4, Info.strTime);
-  Insert.Bind(5, Info.strDatabase);
-  Insert.Bind(6, Info.Inode);
-  Insert.Bind(7, Info.SchemaVersion);
-  Insert.Step();
-}
-
 }  // namespace
 
 void MakeChangeFile(const std::string& strFile, const std::string& strBefore,
@@ -297,23 +250,25 @@ void MakeChangeFile(const std::string& strFile, const std::string& strBefore,
   Db.Attach(strBefore, "before");
   Db.Attach(strAfter, "after");
   Db.Execute(std::string("BEGIN;") + TABLES + APPLICATION_ID + "; PRAGMA user_version = " + FORMAT);
-  StoreUpgrade(Db, Info);
+  Db.Run("INSERT INTO upgrade VALUES (?, ?, ?, ?, ?, ?, ?)", Info.strVersion, Info.strTool,
+         Info.strToolVersion, Info.strTime, Info.strDatabase, Info.Inode, Info.SchemaVersion);
   for (Object& Object : ListObjects(Db)) {
-    if (Object.Table.strReason.empty()) {
-      Compare(Db, Object, &Object.Table);
+    ChangedTable& Table = Object.Table;
+    if (Table.strReason.empty()) {
+      Compare(Db, Object, &Table);
     }
-    StoreTable(Db, Object.Table);
+    Db.Run("INSERT INTO covered VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?)", int64_t{Table.Number},
+           Table.strName, JsonArray(Db, Table.Keys), JsonArray(Db, Table.Collations),
+           JsonArray(Db, Table.Columns), Table.strRowid, int64_t{Table.blRowidOnly},
+           Table.strDefinition, Table.strReason, int64_t{Table.blDoubt});
   }
+  ListDangling(Db, "before", "main.dangling");
   Db.Execute("COMMIT");
 }
 
 void AddFile(const Database& Changes, const std::string& strName,
              std::optional<std::string_view> Before, std::optional<std::string_view> After) {
-  Statement Insert(Changes, "INSERT INTO file VALUES (?, ?, ?)");
-  Insert.Bind(1, strName);
-  Insert.BindBlob(2, Before);
-  Insert.BindBlob(3, After);
-  Insert.Step();
+  Changes.Run("INSERT INTO file VALUES (?, ?, ?)", strName, Before, After);
 }
 
 Upgrade ReadUpgrade(const Database& Changes) {
@@ -348,17 +303,24 @@ std::vector<ChangedTable> ReadTables(const Database& Changes) {
     Table.Columns = List(Read.Text(4));
     Table.strRowid = Read.Text(5);
     Table.blRowidOnly = Read.Int(6) != 0;
-    Table.blDangling = Read.Int(7) != 0;
-    Table.strDefinition = Read.Text(8);
-    Table.strReason = Read.Text(9);
-    Table.blDoubt = Read.Int(10) != 0;
-    if (IsName(Table.strName, "camera")) {
-      Table.Vendor = Find(Table.Columns, "vendor");
-      Table.Model = Find(Table.Columns, "model");
+    Table.strDefinition = Read.Text(7);
+    Table.strReason = Read.Text(8);
+    Table.blDoubt = Read.Int(9) != 0;
+    if (FindName({"camera"}, Table.strName) == 0) {
+      Table.Vendor = FindName(Table.Columns, "vendor");
+      Table.Model = FindName(Table.Columns, "model");
     }
     Tables.push_back(Table);
   }
   return Tables;
+}
+
+int FindName(const std::vector<std::string>& Names, const std::string& strName) {
+  const auto IsIt = [&](const std::string& strIt) {
+    return sqlite3_stricmp(strIt.c_str(), strName.c_str()) == 0;
+  };
+  const auto Found = std::find_if(Names.begin(), Names.end(), IsIt);
+  return Found == Names.end() ? -1 : static_cast<int>(Found - Names.begin());
 }
 
 std::string RowName(const ChangedTable& Table, const Statement& Row, int FirstKey,
@@ -390,4 +352,19 @@ std::string SameKeys(const ChangedTable& Table, const std::string& strRow,
     strSql += Quoted(Table.Collations[Key]);
   }
   return strSql;
+}
+
+void ListDangling(const Database& Db, const std::string& strSchema, const std::string& strList) {
+  const WordMap Words = {{"schema", strSchema}, {"list", strList}};
+  Statement Tables(Db, Fill("SELECT name FROM {schema}.sqlite_schema WHERE type = 'table'", Words));
+  while (Tables.Step()) {
+    try {
+      Db.Run(Fill(DANGLING, Words), Tables.Text(0));
+    } catch (const SqlFailure& Reason) {
+      // The columns that it refers to are not unique: SQLite cannot check this table.
+      if (Reason.Code() != SQLITE_ERROR) {
+        throw;
+      }
+    }
+  }
 }

@@ -5,6 +5,7 @@
 //   covered    a row a table or view of the database: how its rows are stored, or why they are not
 //   before_N   the rows of table N that the upgrade changes or removes, as they are before
 //   after_N    the rows that it changes or adds, as they are afterwards
+//   dangling   the foreign keys of rows that lead nowhere before the upgrade
 //   file       a row a capability file that it changes: name, before, after (NULL: no such file)
 //
 // The columns of before_N and after_N are k0, k1, ... for the keys and c0, c1, ... for the columns
@@ -43,9 +44,7 @@ struct ChangedTable {
   std::vector<std::string> Collations;  // of the keys
   std::vector<std::string> Columns;     // those that are not generated, in order
   std::string strRowid;                 // a name of the rowid; empty if there is none to use
-  bool blRowidOnly = false;  // nothing but the rowid identifies a row; VACUUM may change it
-  // The table has had rows whose foreign keys lead nowhere, or its foreign keys cannot be checked.
-  bool blDangling = false;
+  bool blRowidOnly = false;   // nothing but the rowid identifies a row; VACUUM may change it
   std::string strDefinition;  // its CREATE statement
   // Why the table is not covered: then there are no before_N and after_N. Empty if it is covered.
   std::string strReason;
@@ -69,6 +68,9 @@ void AddFile(const Database& Changes, const std::string& strName,
 Upgrade ReadUpgrade(const Database& Changes);
 std::vector<ChangedTable> ReadTables(const Database& Changes);
 
+// Returns the place of a name, which SQLite compares without regard to case, or -1.
+int FindName(const std::vector<std::string>& Names, const std::string& strName);
+
 // Names a row, such as "camera 12 (VENDOR MODEL)" or "TABLE 'a', 2". The statement's row has all
 // keys from column FirstKey on and all columns of the table from FirstColumn on.
 std::string RowName(const ChangedTable& Table, const Statement& Row, int FirstKey, int FirstColumn);
@@ -77,6 +79,10 @@ std::string RowName(const ChangedTable& Table, const Statement& Row, int FirstKe
 
 // "x0, x1, ...", one for each name, with strPrefix in the place of x.
 std::string Numbered(const std::string& strPrefix, const std::vector<std::string>& Names);
+
+// Counts the foreign keys of rows in the database strSchema that lead nowhere, and adds them to the
+// table strList (child, row, parent, id, count).
+void ListDangling(const Database& Db, const std::string& strSchema, const std::string& strList);
 
 // True if the row strRow of the table has these keys. strKey stands for each of them, as a pattern
 // of ForEach: "b.k{i}" for a row b of the change file, "t.{name}" for another row of the table.

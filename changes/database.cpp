@@ -27,7 +27,8 @@ void Configure(sqlite3* pDb) {
 }  // namespace
 
 Database::Database(const std::string& strName, int Flags) {
-  const int Code = sqlite3_open_v2(strName.c_str(), &m_pDb, Flags | SQLITE_OPEN_NOMUTEX, nullptr);
+  const int Code = sqlite3_open_v2(strName.c_str(), &m_pDb,
+                                   Flags | SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_URI, nullptr);
   if (Code != SQLITE_OK) {
     const std::string strReason = m_pDb == nullptr ? sqlite3_errstr(Code) : sqlite3_errmsg(m_pDb);
     sqlite3_close(m_pDb);
@@ -36,11 +37,18 @@ Database::Database(const std::string& strName, int Flags) {
   Configure(m_pDb);
 }
 
+void Database::AttachReadOnly(const std::string& strFile, const std::string& strSchema) {
+  std::string strUri = "file:";
+  for (const char Char : strFile) {
+    const bool blSpecial = Char == '%' || Char == '?' || Char == '#';
+    strUri += !blSpecial ? std::string{Char} : Char == '%' ? "%25" : Char == '?' ? "%3f" : "%23";
+  }
+  Attach(strUri + "?mode=ro", strSchema);
+}
+
 void Database::Attach(const std::string& strFile, const std::string& strSchema) {
   sqlite3_limit(m_pDb, SQLITE_LIMIT_ATTACHED, MAX_ATTACHED);
-  Statement Attach(*this, "ATTACH ? AS " + Quoted(strSchema));
-  Attach.Bind(1, strFile);
-  Attach.Step();
+  Run("ATTACH ? AS " + Quoted(strSchema), strFile);
   sqlite3_limit(m_pDb, SQLITE_LIMIT_ATTACHED, 0);
 }
 
@@ -79,14 +87,14 @@ void Statement::Bind(int Parameter, int64_t Number) {
   Check(sqlite3_bind_int64(m_pStatement, Parameter, Number));
 }
 
-void Statement::BindBlob(int Parameter, std::optional<std::string_view> Bytes) {
+void Statement::Bind(int Parameter, const std::optional<std::string_view>& Blob) {
   sqlite3_reset(m_pStatement);
-  if (!Bytes) {
+  if (!Blob) {
     Check(sqlite3_bind_null(m_pStatement, Parameter));
     return;
   }
-  const char* pBytes = Bytes->empty() ? "" : Bytes->data();  // a null pointer would bind NULL
-  Check(sqlite3_bind_blob64(m_pStatement, Parameter, pBytes, Bytes->size(), SQLITE_STATIC));
+  const char* pBytes = Blob->empty() ? "" : Blob->data();  // a null pointer would bind NULL
+  Check(sqlite3_bind_blob64(m_pStatement, Parameter, pBytes, Blob->size(), SQLITE_STATIC));
 }
 
 bool Statement::Step() {

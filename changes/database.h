@@ -26,15 +26,20 @@ class SqlFailure : public Failure {
 // opens another file. Waits up to five seconds for a lock. All functions throw SqlFailure.
 class Database {
  public:
-  // strName is an absolute path, since SQLite takes "file:..." for a URI, or "" for a temporary
-  // database. Flags are those of sqlite3_open_v2.
+  // strName is an absolute path, or "" for a temporary database. Flags are those of
+  // sqlite3_open_v2.
   Database(const std::string& strName, int Flags);
   ~Database() { sqlite3_close(m_pDb); }
   Database(const Database&) = delete;
   Database& operator=(const Database&) = delete;
   sqlite3* Get() const { return m_pDb; }
+  // Only reads another database, and never locks it for writing.
+  void AttachReadOnly(const std::string& strFile, const std::string& strSchema);
   void Attach(const std::string& strFile, const std::string& strSchema);
   void Execute(const std::string& strSql) const;
+  // Runs one statement with values for its parameters.
+  template <typename... Values>
+  void Run(const std::string& strSql, const Values&... Parameters) const;
   // Returns the first column of the first row; "" if there is no row.
   std::string Text(const std::string& strSql) const;
   [[noreturn]] void Throw(int Code) const;
@@ -50,11 +55,11 @@ class Statement {
   Statement(const Statement&) = delete;
   Statement& operator=(const Statement&) = delete;
   sqlite3_stmt* Get() const { return m_pStatement; }
-  // Each Bind first resets the statement. The text is copied.
+  // Each Bind first resets the statement. Text is copied. The bytes of a blob are not: they must
+  // live until the statement has run. No bytes bind NULL.
   void Bind(int Parameter, const std::string& strText);
   void Bind(int Parameter, int64_t Number);
-  // Does not copy the bytes: they must live until the statement is run. No bytes bind NULL.
-  void BindBlob(int Parameter, std::optional<std::string_view> Bytes);
+  void Bind(int Parameter, const std::optional<std::string_view>& Blob);
   // Goes to the next row. Returns false if there is none.
   bool Step();
   // Returns a column of the row; "" for NULL.
@@ -69,3 +74,11 @@ class Statement {
   const Database& m_Db;
   sqlite3_stmt* m_pStatement = nullptr;
 };
+
+template <typename... Values>
+void Database::Run(const std::string& strSql, const Values&... Parameters) const {
+  Statement Once(*this, strSql);
+  int Parameter = 0;
+  (Once.Bind(++Parameter, Parameters), ...);
+  Once.Step();
+}
