@@ -18,6 +18,7 @@ import pytest
 SOURCE = Path(__file__).resolve().parents[2]
 TOOL = "main/tesselupgrader"
 PREVIEW = "preview/tessel-preview"
+UNDO = "undo/tessel-undo"
 KIDBGLOG = "tools/kidbglog"
 CLIENT = "tests/unit/client"
 # The leak checker does not work in a traced program.

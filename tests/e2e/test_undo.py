@@ -1,0 +1,255 @@
+"""How tessel-undo takes an upgrade back, and what it leaves."""
+
+import os
+import re
+import shutil
+import sqlite3
+import subprocess
+from contextlib import closing
+
+import pytest
+from conftest import SOURCE, UNDO, changed_rows, run
+from test_documents import options
+
+MAKE = "tests/makechanges"
+# Values that must be unique: two cameras exchange one, and a third loses one.
+# Rows that only a rowid identifies. Rows that others can refer to.
+START = """
+    CREATE UNIQUE INDEX place ON camera (fov) WHERE fov LIKE '% side';
+    UPDATE camera SET fov = 'left side' WHERE id = 3;
+    UPDATE camera SET fov = 'right side' WHERE id = 4;
+    UPDATE camera SET fov = 'rear side' WHERE id = 5;
+    CREATE TABLE note (t);
+    INSERT INTO note VALUES ('a'), ('b'), ('''; ATTACH ''x'' AS x; --');
+    CREATE TABLE relay (id INTEGER PRIMARY KEY,
+      output REFERENCES camdeviceoutput);
+    CREATE VIRTUAL TABLE manual USING fts5 (page);
+    INSERT INTO manual VALUES ('pan and tilt')"""
+UPGRADE = """
+    UPDATE camera SET fov = '' WHERE id = 3;
+    UPDATE camera SET fov = 'left side' WHERE id = 4;
+    UPDATE camera SET fov = 'right side' WHERE id = 3;
+    UPDATE camera SET fov = '' WHERE id = 5;
+    UPDATE note SET t = t || '!';"""
+
+
+@pytest.fixture
+def upgraded(example, tmp_path):
+    """Upgrades the example, with more changes, and makes a change file."""
+
+    def upgrade(more=UPGRADE, start=START, name="changes"):
+        example.sql(start + ";")
+        shutil.copy(example.database, tmp_path / "before.db")
+        shutil.copytree(example.caps, tmp_path / "caps", dirs_exist_ok=True)
+        example.rows_before = example.rows()
+        example.files_before = example.capability_files()
+        example.upgrade(0)
+        example.sql(more + ";")
+        shutil.copy(example.database, tmp_path / "after.db")
+        states = tmp_path / "before.db", tmp_path / "after.db"
+        files = tmp_path / "caps", example.caps
+        file = example.directory / name
+        command = [file, *states, example.database, *files]
+        subprocess.check_call(example.command(MAKE, *command))
+        return file
+
+    return upgrade
+
+
+def undo(example, *arguments, status=0):
+    ended = run(*example.command(UNDO, *arguments))
+    assert ended.returncode == status, ended.stdout
+    return ended.stdout
+
+
+def left(output):
+    return [line for line in output.splitlines() if line.startswith("left: ")]
+
+
+def test_all_goes_back_once(example, upgraded):
+    file = upgraded()
+    (example.caps / "link").symlink_to("EX-2100")
+    os.chmod(example.caps / "EX-2100", 0o640)
+    dry = undo(example, "--dry-run", file)
+    assert example.rows() != example.rows_before
+    assert undo(example, file) == dry
+    counts = dry.splitlines()[-1].split()
+    assert counts[3:5] == ["0", "left,"]
+    assert changed_rows(example.rows_before, example.rows()) == []
+    files = example.capability_files()
+    assert files.pop("link") == files["EX-2100"]
+    assert files == example.files_before
+    assert (example.caps / "EX-2100").stat().st_mode & 0o777 == 0o640
+    again = undo(example, file).splitlines()[-1]
+    assert again == f"0 set back, 0 left, {counts[0]} already as before"
+
+
+CAMERA_1 = "camera 1 (ABUS TVIP62000) changed: before resolution='QVGA'"
+ALL = "resolution='320x240', live_resolution='320x240'"
+OUTPUT_12 = "camdeviceoutput 12 added: before none; after id=12, "
+FORBIDDEN = "UNIQUE, CHECK or NOT NULL forbids it now"
+# What somebody does after the upgrade, and how the line on what is left
+# begins and ends. Only these rows differ from those at the start.
+LEFT = {
+    "UPDATE camera SET resolution = 'MINE' WHERE id = 1": (
+        f"{CAMERA_1}; after resolution='320x240'; now resolution='MINE'",
+        "it has been changed since",
+    ),
+    "UPDATE camera SET vendor = 'Acme', model = 'X' WHERE id = 1": (
+        f"{CAMERA_1}, live_resolution='QVGA'; after {ALL}; now {ALL}",
+        "it is another camera now",
+    ),
+    "DELETE FROM camera WHERE id = 1": (
+        f"{CAMERA_1}, live_resolution='QVGA'; after {ALL}; now none",
+        "the row is gone",
+    ),
+    "UPDATE camdeviceoutput SET name = 'Gate' WHERE id = 12": (
+        OUTPUT_12,
+        "the row has been changed since",
+    ),
+    "INSERT INTO relay VALUES (1, 12)": (
+        OUTPUT_12,
+        "a row of relay refers to it",
+    ),
+    "UPDATE camera SET fov = 'rear side' WHERE id = 6": (
+        "camera 5 (ABUS TVIP62000) changed: before fov='rear side'; ",
+        FORBIDDEN,
+    ),
+    "DELETE FROM note WHERE t = 'a!'; VACUUM": (
+        "note: 3 rows",
+        "its rows may have been renumbered since",
+    ),
+    "ALTER TABLE note ADD COLUMN u": (
+        "note: 3 rows",
+        "its definition has been changed since",
+    ),
+    "INSERT INTO note VALUES ('c'); UPDATE note SET t = 'd' WHERE rowid = 1": (
+        "note 1 changed: before t='a'; after t='a!'; now t='d'",
+        "the row has been changed since",
+    ),
+}
+
+
+def names(before, after):
+    return {" ".join(line.split()[:2]) for line in changed_rows(before, after)}
+
+
+@pytest.mark.parametrize("since", LEFT)
+def test_what_somebody_has_changed_is_left_and_named(example, upgraded, since):
+    file = upgraded()
+    rows = example.rows()
+    example.sql(since + ";")
+    allowed = names(rows, example.rows())
+    begin, end = LEFT[since]
+    (line,) = left(undo(example, file, status=3))
+    assert re.fullmatch(f"left: {re.escape(begin)}.*\\({end}\\)", line)
+    allowed.add(" ".join(line.split()[1:3]))
+    remaining = names(example.rows_before, example.rows())
+    # The rows of notes have no names.
+    assert {row for row in remaining if "note" not in row} <= allowed
+
+
+def test_an_interrupted_upgrade_goes_back(example, upgraded):
+    file = upgraded()
+    example.sql("UPDATE camera SET resolution = 'QVGA' WHERE id = 1")
+    example.sql("UPDATE note SET t = 'a' WHERE t = 'a!'")
+    example.sql("DELETE FROM camdeviceoutput WHERE id = 12")
+    assert not left(undo(example, file))
+    assert changed_rows(example.rows_before, example.rows()) == []
+
+
+def test_the_later_upgrade_goes_back_first(example, upgraded):
+    first = upgraded()
+    more = "UPDATE camera SET resolution = 'twice' WHERE id = 1"
+    second = upgraded(more, "", "second")
+    (line,) = left(undo(example, first, status=3))
+    assert line.startswith(f"left: {CAMERA_1}; after ")
+    undo(example, second)
+    undo(example, first)
+    cameras = example.sql("SELECT resolution FROM camera WHERE id = 1")
+    assert cameras == [("QVGA",)]
+
+
+def test_an_index_of_words_stays_whole(example, upgraded):
+    file = upgraded("UPDATE manual SET page = 'zoom'")
+    output = undo(example, file, status=3)
+    part = "not in the undo: manual_content (holds the content of a virtual "
+    assert part in output
+    found = "SELECT page FROM manual WHERE manual MATCH 'zoom'"
+    assert example.sql(found) == [("zoom",)]
+
+
+def test_a_changed_capability_file_is_left(example, upgraded):
+    file = upgraded()
+    example.capability_file("EX-2100", "mine\n")
+    (example.caps / "EX-4310").unlink()
+    (example.caps / "EX-4310").mkdir()
+    output = undo(example, file, status=3)
+    changed, unreadable = left(output)
+    assert changed.startswith("left: file EX-2100: before ")
+    assert changed.endswith("now 5 bytes (it has been changed since)")
+    assert unreadable.startswith("left: file EX-4310: ")
+    assert example.capability_files()["EX-2100"] == "mine\n"
+
+
+def test_a_link_leads_to_the_database_that_sqlite_opens(
+    example, upgraded, tmp_path
+):
+    file = upgraded()
+    deep = tmp_path / "a/b"
+    deep.mkdir(parents=True)
+    (tmp_path / "link").symlink_to(deep)
+    # As text, link/.. would be tmp_path.
+    (tmp_path / "a/system.db").symlink_to(example.database)
+    database = tmp_path / "link/../system.db"
+    undo(example, "--caps", example.caps, file, database)
+    assert changed_rows(example.rows_before, example.rows()) == []
+
+
+def test_nobody_need_read_the_output(example, upgraded):
+    file = upgraded()
+    command = example.command(UNDO, file)
+    with subprocess.Popen(command, stdout=subprocess.PIPE) as process:
+        process.stdout.close()
+    assert changed_rows(example.rows_before, example.rows()) == []
+
+
+REFUSED = {
+    # what is wrong, and the message
+    "chmod 777 .": "others can write /var/packages/Camveld/target/",
+    "chmod 666 changes": "others can write /var/packages/Camveld/target/c",
+    "echo text >system.db": "file is not a database",
+    "cp system.db changes": "changes is not a change file",
+    "mkfifo a; mv a changes": "changes is not a regular file",
+    "mv system.db a; cp a system.db": "system.db has been replaced since",
+    "mv system.db /var/b; ln -s /var/b system.db": "the file belongs to",
+    "rm changes": "No such file or directory",
+    "mkdir a; rm -r a; rm system.db": "No such file or directory",
+}
+
+
+@pytest.mark.parametrize("wrong", REFUSED)
+def test_one_line_says_why_nothing_is_done(example, upgraded, wrong):
+    file = upgraded()
+    files = example.capability_files()
+    subprocess.check_call(["sh", "-ec", wrong], cwd=example.directory)
+    output = undo(example, file, status=2)
+    assert output.startswith("tessel-undo: ") and output.count("\n") == 1
+    assert REFUSED[wrong] in output
+    assert example.capability_files() == files
+    if "has been replaced" in output or "belongs" in output:
+        undo(example, "--force", file)
+        assert changed_rows(example.rows_before, example.rows()) == []
+
+
+def test_a_locked_database_is_not_touched(example, upgraded):
+    file = upgraded()
+    with closing(sqlite3.connect(example.database)) as recorder:
+        recorder.execute("BEGIN IMMEDIATE")
+        output = undo(example, file, status=2)
+    assert "another process has held it locked for five seconds" in output
+
+
+def test_the_man_page_has_all_options(appliance):
+    page = (SOURCE / "docs/tessel-undo.8").read_text().replace("\\-", "-")
+    assert options(undo(appliance, "--help")) == options(page)

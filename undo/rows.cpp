@@ -1,0 +1,309 @@
+#include "rows.h"
+
+#include <algorithm>
+#include <cinttypes>
+#include <cstdio>
+
+#include "value.h"
+
+namespace {
+
+// In all patterns, t is the row of the table, b and a are the row before and after the upgrade, and
+// x is the row of row_N.
+
+constexpr const char* CREATE_LIST =
+    "CREATE TEMP TABLE row_{n} ({keys}, kind, back, done, lost, whole, r, reason)";
+
+// Adds up four counts in one number, and then takes them apart: changes to set back, as before
+// already and changed since, and other columns that have been changed since. A part of a row may be
+// as before, because an upgrade can be killed.
+constexpr const char* LIST_CHANGED = R"(
+  INSERT INTO temp.row_{n}
+  SELECT {keys}, 'changed', n % 1024, n / 1024 % 1024, n / 1048576 % 1024, n < 1048576, now_r,
+    CASE WHEN other IS NULL AND n >= 1048576 AND NOT {is_camera}
+      THEN 'the row has been changed since' ELSE other END
+  FROM (
+    SELECT b.*, {counts} AS n, {rowid} AS now_r, CASE WHEN NOT {present} THEN 'the row is gone'
+      WHEN NOT ({same_camera}) THEN 'it is another camera now' END AS other
+    FROM changes.before_{n} AS b CROSS JOIN changes.after_{n} AS a ON {a_is_b}
+      LEFT JOIN main.{table} AS t ON {t_is_b}))";
+
+constexpr const char* COUNT_CELL = R"(
+  CASE WHEN {unchanged} THEN CASE WHEN {as_after} THEN 0 ELSE 1073741824 END
+    WHEN NOT {present} THEN 1048576
+    WHEN {as_after} THEN 1 WHEN {as_before} THEN 1024 ELSE 1048576 END)";
+
+constexpr const char* LIST_ADDED = R"(
+  INSERT INTO temp.row_{n}
+  SELECT {keys}, 'added', present AND as_after, NOT present, present AND NOT as_after, 1, 0,
+    CASE WHEN present AND NOT as_after THEN 'the row has been changed since' END
+  FROM (
+    SELECT a.*, {present} AS present, {t_as_a} AS as_after
+    FROM changes.after_{n} AS a LEFT JOIN main.{table} AS t ON {t_is_a}
+    WHERE NOT EXISTS (SELECT 1 FROM changes.before_{n} AS b WHERE {a_is_b})))";
+
+constexpr const char* LIST_REMOVED = R"(
+  INSERT INTO temp.row_{n}
+  SELECT {keys}, 'removed', NOT present, present AND as_before, present AND NOT as_before, 1,
+    {old_rowid}, CASE WHEN present AND NOT as_before THEN 'another row has its key' END
+  FROM (
+    SELECT b.*, {present} AS present, {t_as_b} AS as_before
+    FROM changes.before_{n} AS b LEFT JOIN main.{table} AS t ON {t_is_b}
+    WHERE NOT EXISTS (SELECT 1 FROM changes.after_{n} AS a WHERE {a_is_b})))";
+
+constexpr const char* MERGE_CELL =
+    "CASE WHEN ({unchanged}) OR NOT ({as_after}) THEN {now} ELSE {before} END AS c{i}";
+
+// The rows with cells of both sides: those that somebody has changed since stay.
+constexpr const char* MERGE = R"(
+  CREATE TEMP TABLE merged_{n} AS
+  SELECT {x_keys}, {merged} FROM temp.row_{n} AS x
+    CROSS JOIN changes.before_{n} AS b ON {x_is_b} CROSS JOIN changes.after_{n} AS a ON {a_is_b}
+    CROSS JOIN main.{table} AS t ON {t_is_b}
+  WHERE {goes_back} AND x.kind = 'changed' AND NOT x.whole)";
+
+constexpr const char* DELETE = R"(
+  DELETE FROM main.{table} WHERE ({collated_keys}) IN (
+    SELECT {keys} FROM temp.row_{n} AS x WHERE {goes_back} AND x.kind <> 'removed'))";
+
+// A removed row gets another rowid if its own has been given to another row.
+constexpr const char* FREE_ROWIDS = R"(
+  UPDATE temp.row_{n} AS x SET r = NULL WHERE x.kind = 'removed' AND EXISTS (
+    SELECT 1 FROM main.{table} AS t WHERE {rowid} = x.r))";
+
+// The table's own answers to a conflict, such as REPLACE, do not count here.
+constexpr const char* INSERT_MERGED = R"(
+  INSERT OR IGNORE INTO main.{table} ({columns}) SELECT {values}
+  FROM temp.merged_{n} AS b JOIN temp.row_{n} AS x ON {x_is_b})";
+
+constexpr const char* INSERT_WHOLE = R"(
+  INSERT OR IGNORE INTO main.{table} ({columns}) SELECT {values}
+  FROM temp.row_{n} AS x CROSS JOIN changes.before_{n} AS b ON {x_is_b}
+  WHERE {goes_back} AND x.kind <> 'added' AND x.whole AND x.r IS NOT NULL)";
+
+constexpr const char* INSERT_WITHOUT_ROWID = R"(
+  INSERT OR IGNORE INTO main.{table} ({columns}) SELECT {values}
+  FROM temp.row_{n} AS x CROSS JOIN changes.before_{n} AS b ON {x_is_b}
+  WHERE {goes_back} AND x.kind <> 'added' AND x.whole AND x.r IS NULL)";
+
+constexpr const char* REFUSED = R"(
+  SELECT x.rowid FROM temp.row_{n} AS x
+  WHERE {goes_back} AND x.kind <> 'added'
+    AND NOT EXISTS (SELECT 1 FROM main.{table} AS t WHERE {t_is_x}))";
+
+constexpr const char* SUMS = R"(
+  SELECT total(back) FILTER (WHERE reason IS NULL),
+    total(lost) + total(back) FILTER (WHERE reason IS NOT NULL), total(done) FROM temp.row_{n})";
+
+// Of a changed row that is there, the cells that are as before are not left.
+constexpr const char* MARK_CELL = R"(
+  CASE WHEN x.kind = 'changed' AND (({unchanged}) OR (x.back + x.done > 0 AND {as_before}))
+    THEN '.' ELSE 'x' END)";
+
+constexpr const char* LEFT = R"(
+  SELECT x.kind, coalesce(x.reason, 'it has been changed since'), {present}, {marks}, {x_keys},
+    {b_columns}, {a_columns}, {t_columns}
+  FROM temp.row_{n} AS x LEFT JOIN changes.before_{n} AS b ON {x_is_b}
+    LEFT JOIN changes.after_{n} AS a ON {x_is_a} LEFT JOIN main.{table} AS t ON {t_is_x}
+  WHERE x.lost > 0 OR (x.back > 0 AND x.reason IS NOT NULL) ORDER BY x.rowid)";
+
+constexpr const char* ROWS = R"(
+  SELECT count(*) FROM (SELECT {keys} FROM changes.before_{n} UNION
+                        SELECT {keys} FROM changes.after_{n}))";
+
+constexpr int FIRST_KEY = 4;
+
+std::string SameStored(const ChangedTable& Table, const std::string& strA,
+                       const std::string& strB) {
+  return ForEach(Table.Keys, strA + ".k{i} = " + strB + ".k{i}", " AND ");
+}
+
+std::string CollatedKeys(const ChangedTable& Table) {
+  std::string strSql;
+  for (size_t Key = 0; Key < Table.Keys.size(); ++Key) {
+    strSql += Key == 0 ? "" : ", ";
+    strSql += Quoted(Table.Keys[Key]) + " COLLATE " + Quoted(Table.Collations[Key]);
+  }
+  return strSql;
+}
+
+// In "camera", the same vendor and model make it the same row.
+bool IsCamera(const ChangedTable& Table) { return Table.Vendor != -1 && Table.Model != -1; }
+
+std::string SameCamera(const ChangedTable& Table) {
+  std::string strSql = "1";
+  for (const int Column : {Table.Vendor, Table.Model}) {
+    if (IsCamera(Table)) {
+      const WordMap Words = {{"name", Quoted(Table.Columns[static_cast<size_t>(Column)])},
+                             {"i", std::to_string(Column)}};
+      strSql += Fill(" AND (" + SameValue("t.{name}", "a.c{i}") + " OR " +
+                         SameValue("t.{name}", "b.c{i}") + ")",
+                     Words);
+    }
+  }
+  return strSql;
+}
+
+// True if the rows have a rowid that no column holds.
+bool HasOwnRowid(const ChangedTable& Table) {
+  const auto& Columns = Table.Columns;
+  return !Table.strRowid.empty() &&
+         std::find(Columns.begin(), Columns.end(), Table.strRowid) == Columns.end();
+}
+
+WordMap MakeWords(const ChangedTable& Table) {
+  const std::vector<std::string>& Columns = Table.Columns;
+  const bool blRowid = HasOwnRowid(Table);
+  const std::string strRowid = blRowid ? Quoted(Table.strRowid) : "";
+  const WordMap Cell = {
+      {"unchanged", SameValue("a.c{i}", "b.c{i}")},
+      {"as_after", SameValue("t.{name}", "a.c{i}")},
+      {"as_before", SameValue("t.{name}", "b.c{i}")},
+      {"present", "(t." + Quoted(Table.Keys[0]) + " IS NOT NULL)"},
+      {"i", "{i}"},
+      {"now", "t.{name}"},
+      {"before", "b.c{i}"},
+  };
+  const auto EachCell = [&](const char* szPattern, const char* szBetween) {
+    return ForEach(Columns, Fill(szPattern, Cell), szBetween);
+  };
+  return {
+      {"n", std::to_string(Table.Number)},
+      {"table", Quoted(Table.strName)},
+      {"goes_back", GOES_BACK},
+      {"present", Cell.at("present")},
+      {"is_camera", IsCamera(Table) ? "1" : "0"},
+      {"same_camera", SameCamera(Table)},
+      {"keys", Numbered("k", Table.Keys)},
+      {"x_keys", Numbered("x.k", Table.Keys)},
+      {"collated_keys", CollatedKeys(Table)},
+      {"a_is_b", SameStored(Table, "a", "b")},
+      {"x_is_a", SameStored(Table, "x", "a")},
+      {"x_is_b", SameStored(Table, "x", "b")},
+      {"t_is_a", SameKeys(Table, "t", "a.k{i}")},
+      {"t_is_b", SameKeys(Table, "t", "b.k{i}")},
+      {"t_is_x", SameKeys(Table, "t", "x.k{i}")},
+      {"t_as_a", EachCell("({as_after})", " AND ")},
+      {"t_as_b", EachCell("({as_before})", " AND ")},
+      {"b_columns", Numbered("b.c", Columns)},
+      {"a_columns", Numbered("a.c", Columns)},
+      {"t_columns", ForEach(Columns, "t.{name}", ", ")},
+      {"counts", EachCell(COUNT_CELL, " + ")},
+      {"merged", EachCell(MERGE_CELL, ", ")},
+      {"marks", EachCell(MARK_CELL, " || ")},
+      {"rowid", blRowid ? "t." + strRowid : "0"},
+      {"old_rowid", !blRowid            ? "0"
+                    : Table.blRowidOnly ? "k0"
+                                        : "r"},
+      {"columns", (blRowid ? strRowid + ", " : "") + ForEach(Columns, "{name}", ", ")},
+      {"values", (blRowid ? "x.r, " : "") + Numbered("b.c", Columns)},
+  };
+}
+
+}  // namespace
+
+TableUndo::TableUndo(const Database& Db, const ChangedTable& Table, bool blRebuilt)
+    : m_Db(Db), m_Table(Table), m_Words(MakeWords(Table)), m_strReason(FindReason(blRebuilt)) {}
+
+std::string TableUndo::FindReason(bool blRebuilt) const {
+  Statement Definition(m_Db,
+                       "SELECT sql FROM main.sqlite_schema WHERE type = 'table' AND name = ?");
+  Definition.Bind(1, m_Table.strName);
+  if (!Definition.Step() || Definition.Text(0) != m_Table.strDefinition) {
+    return "its definition has been changed since";
+  }
+  if (blRebuilt && m_Table.blRowidOnly) {
+    return "its rows may have been renumbered since";
+  }
+  try {
+    const Statement Delete(m_Db, Fill("DELETE FROM main.{table}", m_Words));
+    const Statement Insert(m_Db, Fill("INSERT INTO main.{table} DEFAULT VALUES", m_Words));
+    return "";
+  } catch (const SqlFailure& Reason) {
+    return Reason.what();  // such as an index with a function that only the recorder has
+  }
+}
+
+void TableUndo::Classify() const {
+  Execute(CREATE_LIST);
+  if (m_strReason.empty()) {
+    Execute(LIST_CHANGED);
+    Execute(LIST_ADDED);
+    Execute(LIST_REMOVED);
+  }
+}
+
+void TableUndo::Leave(const std::vector<LeftRow>& Left) const {
+  for (const LeftRow& Row : Left) {
+    if (Row.Number == m_Table.Number) {
+      m_Db.Run(Fill("UPDATE temp.row_{n} SET reason = ? WHERE rowid = ?", m_Words), Row.strReason,
+               Row.Row);
+    }
+  }
+}
+
+void TableUndo::Apply(std::vector<LeftRow>* pLeft) const {
+  if (!m_strReason.empty()) {
+    return;
+  }
+  Execute(MERGE);
+  Execute(DELETE);
+  if (HasOwnRowid(m_Table) && !m_Table.blRowidOnly) {
+    Execute(FREE_ROWIDS);
+  }
+  for (const char* szPattern : {INSERT_MERGED, INSERT_WHOLE, INSERT_WITHOUT_ROWID}) {
+    Execute(szPattern);
+  }
+  Statement Refused(m_Db, Fill(REFUSED, m_Words));
+  while (Refused.Step()) {
+    pLeft->push_back({m_Table.Number, Refused.Int(0), "UNIQUE, CHECK or NOT NULL forbids it now"});
+  }
+}
+
+// --- What is left ---
+
+void TableUndo::Print(Counts* pCounts) const {
+  if (!m_strReason.empty()) {
+    Statement Rows(m_Db, Fill(ROWS, m_Words));
+    if (Rows.Step() && Rows.Int(0) > 0) {
+      printf("left: %s: %" PRId64 " rows (%s)\n", Name(m_Table.strName).c_str(), Rows.Int(0),
+             Name(m_strReason).c_str());
+      pCounts->Left += Rows.Int(0);
+    }
+    return;
+  }
+  Statement Sums(m_Db, Fill(SUMS, m_Words));
+  Sums.Step();
+  pCounts->Back += Sums.Int(0);
+  pCounts->Left += Sums.Int(1);
+  pCounts->Done += Sums.Int(2);
+  Statement Left(m_Db, Fill(LEFT, m_Words));
+  while (Left.Step()) {
+    PrintChange(Left);
+  }
+}
+
+void TableUndo::PrintChange(const Statement& Row) const {
+  const std::string strMarks = Row.Text(3);
+  const auto Columns = static_cast<int>(m_Table.Columns.size());
+  const int Before = FIRST_KEY + static_cast<int>(m_Table.Keys.size());
+  const int After = Before + Columns;
+  const auto Values = [&](int First) {
+    std::string strValues;
+    for (int Column = 0; Column < Columns; ++Column) {
+      const auto Idx = static_cast<size_t>(Column);
+      if (strMarks[Idx] == 'x') {
+        strValues += (strValues.empty() ? "" : ", ") + Name(m_Table.Columns[Idx]) + "=";
+        strValues += Shown(Row.Value(First + Column));
+      }
+    }
+    return strValues;
+  };
+  const std::string strKind = Row.Text(0);
+  const bool blAdded = strKind == "added";
+  const bool blRemoved = strKind == "removed";
+  printf("left: %s %s: before %s; after %s; now %s (%s)\n",
+         RowName(m_Table, Row, FIRST_KEY, blRemoved ? Before : After).c_str(), strKind.c_str(),
+         blAdded ? "none" : Values(Before).c_str(), blRemoved ? "none" : Values(After).c_str(),
+         Row.Int(2) == 0 ? "none" : Values(After + Columns).c_str(), Name(Row.Text(1)).c_str());
+}

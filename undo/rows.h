@@ -1,0 +1,69 @@
+// Takes back the changes of one table.
+//
+// The temporary table row_N says what becomes of each row of the change file:
+//   k0, k1, ...       its keys
+//   kind              'changed', 'added' or 'removed' by the upgrade
+//   back, done, lost  how many of its changes are to be set back, are as before already, and have
+//                     been changed since
+//   whole             each of its columns holds its value before or after the upgrade
+//   r                 its rowid, if no column holds it
+//   reason            why the whole row is left, or NULL
+// The rowids of row_N depend on the change file alone, so that they name a row in a later
+// transaction, too.
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "changefile.h"
+
+// What has become of cells, rows and files.
+struct Counts {
+  int64_t Back = 0;  // set back
+  int64_t Left = 0;  // left, and named
+  int64_t Done = 0;  // as before already
+};
+
+// A row of row_N that must be left, and why.
+struct LeftRow {
+  int Number;
+  int64_t Row;
+  std::string strReason;
+};
+
+// SQL: the row x of row_N goes back.
+constexpr const char* GOES_BACK = "x.back > 0 AND x.reason IS NULL";
+
+// One table. All functions run in one transaction and throw SqlFailure.
+class TableUndo {
+ public:
+  // Db is the recorder's database, with the change file attached as "changes". If blRebuilt, SQLite
+  // may have given other rowids to the rows.
+  TableUndo(const Database& Db, const ChangedTable& Table, bool blRebuilt);
+
+  const ChangedTable& Table() const { return m_Table; }
+
+  // Creates row_N.
+  void Classify() const;
+
+  // Leaves the rows of Left that belong to this table.
+  void Leave(const std::vector<LeftRow>& Left) const;
+
+  // Takes back what goes back. All rows go before the first comes back, because SQLite checks
+  // UNIQUE row by row. Appends the rows that the table then refuses to *pLeft.
+  void Apply(std::vector<LeftRow>* pLeft) const;
+
+  // Prints a line for each change that is left, and adds up all changes.
+  void Print(Counts* pCounts) const;
+
+ private:
+  std::string FindReason(bool blRebuilt) const;
+  void Execute(const char* szPattern) const { m_Db.Execute(Fill(szPattern, m_Words)); }
+  void PrintChange(const Statement& Row) const;
+
+  const Database& m_Db;
+  const ChangedTable m_Table;
+  const WordMap m_Words;          // of the patterns of all statements
+  const std::string m_strReason;  // why no row of the table can go back; empty if rows can
+};
