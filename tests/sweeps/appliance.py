@@ -128,15 +128,15 @@ def run(disk, *command):
     return done.returncode, read_disk()
 
 
-def disturb(disk, call, what):
-    """Runs the tool, and disturbs a call or, with a plus, all from there."""
+def disturb(disk, call, what, command=TOOL):
+    """Runs a command, and disturbs a call or, with a plus, all from there."""
     name, number = call.split()
     # The filter is faster, but signals do not come through it.
     fast = [] if "signal" in what else ["--seccomp-bpf", "-f"]
     when = number + "+" * what.endswith("+")
     inject = f"--inject={name}:{what.rstrip('+')}:when={when}"
     strace = ["strace", *fast, "-o", TRACE, f"--trace={name}", inject]
-    status, left = run(disk, *strace, *TOOL)
+    status, left = run(disk, *strace, *command)
     came = status == -9 or "INJECTED" in TRACE.read_text()
     assert came, "the call did not come"
     return status, left

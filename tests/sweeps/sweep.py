@@ -2,14 +2,13 @@
 
 import argparse
 import re
-import sqlite3
 import sys
-import time
+from functools import partial
 from itertools import dropwhile, islice, pairwise
-from subprocess import TimeoutExpired
 
 from appliance import CAPS, DATABASE, LOG, TARGET, TOOL, Appliance
 from appliance import capabilities, disturb, record, rows
+import cases
 
 CHANGES = "p?write|ftruncate|f(data)?sync|fch|rename|unlink|open.*O_CREAT"
 # The first that matches. SQLite and the tool tell apart at most "again",
@@ -132,19 +131,6 @@ parser.add_argument("case", nargs="?")
 args = parser.parse_intermixed_args()
 
 appliance = Appliance(args.wal)
-cases = list(chosen(KINDS[args.kind](appliance), args))
-sweep = args.kind + " --wal" * args.wal
-failed = 0
-start = time.monotonic()
-for done, (name, *case) in enumerate(cases, 1):
-    try:
-        CHECKS[args.kind](appliance, *case)
-    except (AssertionError, sqlite3.Error, TimeoutExpired) as reason:
-        failed += 1
-        print(f"scripts/sweep {sweep} '{name}': {reason}", flush=True)
-    if sys.stderr.isatty():
-        left = (time.monotonic() - start) / done * (len(cases) - done) / 60
-        text = f"{sweep}: {done} of {len(cases)}, {left:.1f} minutes left"
-        print(text, end="\x1b[K\r", file=sys.stderr, flush=True)
-print(f"{sweep}: {len(cases)} cases, {failed} failed")
-sys.exit(0 if cases and not failed else 1)
+check = partial(CHECKS[args.kind], appliance)
+found = chosen(KINDS[args.kind](appliance), args)
+sys.exit(cases.run(args.kind + " --wal" * args.wal, found, check))
