@@ -16,10 +16,10 @@ from subprocess import PIPE, STDOUT
 import pytest
 
 SOURCE = Path(__file__).resolve().parents[2]
-TOOL = "main/tesselupgrader"
-PREVIEW = "preview/tessel-preview"
-UNDO = "undo/tessel-undo"
-KIDBGLOG = "tools/kidbglog"
+TOOL = "sbin/tesselupgrader"
+PREVIEW = "sbin/tessel-preview"
+UNDO = "sbin/tessel-undo"
+KIDBGLOG = "sbin/kidbglog"
 CLIENT = "tests/unit/client"
 # The leak checker does not work in a traced program.
 STRACE = "strace -o /dev/null -E ASAN_OPTIONS=detect_leaks=0".split()

@@ -13,7 +13,7 @@ from pathlib import Path
 from typing import NamedTuple
 
 TARGET = "/var/packages/Camveld/target"
-TOOL = ["build/release/main/tesselupgrader", "0"]
+TOOL = ["build/release/sbin/tesselupgrader", "0"]
 DATABASE = "system.db"
 CAPS = "@camveld/@KICapInfo"
 LOG = Path("/var/log/camveld/camveld.log")

@@ -17,7 +17,7 @@ from appliance import disturb, read_disk, record, rows
 from appliance import run as run_on
 from cases import run
 
-UNDO = "build/release/undo/tessel-undo"
+UNDO = "build/release/sbin/tessel-undo"
 MAKE = "build/release/tests/makechanges"
 BEFORE, AFTER, FILE = "/var/before.db", "/var/after.db", "/var/changes"
 KEPT = "changes"  # FILE on a disk of its own

@@ -16,7 +16,7 @@ from .table import SIZES
 
 ROOT = Path(__file__).resolve().parents[2]
 BUILD = ROOT / "build/bench"
-TOOL = BUILD / "main/tesselupgrader"
+TOOL = BUILD / "sbin/tesselupgrader"
 CALLS = BUILD / "tools/bench/calls"
 DATABASE = Path("/var/packages/Camveld/target/system.db")
 START = Path("/var/start.db")  # what is copied to DATABASE before each run
@@ -26,7 +26,7 @@ RESULT = Path("/var/result")  # of a program that measures another
 
 SYNC = "PRAGMA synchronous = EXTRA"  # what the tool promises, too
 UPGRADE = [TOOL, "0"]
-PREVIEW = [BUILD / "preview/tessel-preview", "--tool", TOOL, DATABASE, "0"]
+PREVIEW = [BUILD / "sbin/tessel-preview", DATABASE, "0"]
 UPDATE_FILES = [TOOL, "--updateCap", FILES]
 GREP = ["grep", "-c", "=", "-r", FILES]
 SED = ["sh", "-c", rf"sed -i -E 's/^(pan|tilt) = yes/\1= step/' {FILES}/*"]
