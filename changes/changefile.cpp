@@ -44,7 +44,7 @@ constexpr const char* OBJECTS = R"(
       WHEN name LIKE 'sqlite\_%' ESCAPE '\' THEN 'belongs to SQLite'
     END, type = 'shadow' OR EXISTS (
       SELECT 1 FROM pragma_table_list AS v WHERE v.type = 'virtual' AND v.ncol = 0
-      AND substr(name, 1, length(v.name) + 1) = v.name || '_' COLLATE NOCASE)
+      AND substr(l.name, 1, length(v.name) + 1) = v.name || '_' COLLATE NOCASE)
   FROM definition JOIN pragma_table_list AS l USING (name) WHERE l.schema = side
   GROUP BY name ORDER BY name)";
 
@@ -187,6 +187,9 @@ void Compare(const Database& Db, const Object& Object, ChangedTable* pTable) {
   try {
     ReadColumns(Db, pTable);
     const std::string strIndex = ReadKeys(Db, Object, pTable);
+    // A collation that only the recorder has gets a clear message here.
+    const Statement Ordered(Db, "SELECT 1 FROM before." + Quoted(pTable->strName) + " ORDER BY " +
+                                    ForEach(pTable->Keys, "{name}", ", "));
     StoreRows(Db, *pTable, strIndex);
     if (Object.blShadow) {
       pTable->blDoubt = HasChanges(Db, *pTable);
@@ -329,7 +332,7 @@ std::string RowName(const ChangedTable& Table, const Statement& Row, int FirstKe
   for (size_t Key = 0; Key < Table.Keys.size(); ++Key) {
     strName += (Key == 0 ? " " : ", ") + Shown(Row.Value(FirstKey + static_cast<int>(Key)));
   }
-  if (Table.Vendor == -1 || Table.Model == -1) {
+  if (FirstColumn == -1 || !Table.IsCamera()) {
     return strName;
   }
   return strName + " (" + Plain(Row.Value(FirstColumn + Table.Vendor)) + " " +

@@ -49,9 +49,11 @@ struct ChangedTable {
   // Why the table is not covered: then there are no before_N and after_N. Empty if it is covered.
   std::string strReason;
   bool blDoubt = false;  // not covered, although the upgrade changes it or nobody can tell
-  // A row of the recorder's cameras has these columns, counted from 0. In other tables: -1.
+  // What names a camera: columns, counted from 0. -1 in other tables.
   int Vendor = -1;
   int Model = -1;
+
+  bool IsCamera() const { return Vendor != -1 && Model != -1; }
 };
 
 // Creates strFile (mode 0600) from the databases before and after. All names are absolute. The file
@@ -72,7 +74,8 @@ std::vector<ChangedTable> ReadTables(const Database& Changes);
 int FindName(const std::vector<std::string>& Names, const std::string& strName);
 
 // Names a row, such as "camera 12 (VENDOR MODEL)" or "TABLE 'a', 2". The statement's row has all
-// keys from column FirstKey on and all columns of the table from FirstColumn on.
+// keys from column FirstKey on and all columns of the table from FirstColumn on. A FirstColumn of -1
+// leaves the vendor and the model out.
 std::string RowName(const ChangedTable& Table, const Statement& Row, int FirstKey, int FirstColumn);
 
 // --- SQL ---

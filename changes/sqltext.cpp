@@ -13,22 +13,29 @@ std::string Fill(const std::string& strPattern, const WordMap& Words) {
 }
 
 std::string ForEach(const std::vector<std::string>& Names, const std::string& strPattern,
-                    const std::string& strBetween) {
+                    const std::string& strBetween, WordMap Words) {
   std::string strText;
   for (size_t Idx = 0; Idx < Names.size(); ++Idx) {
-    strText += Idx == 0 ? "" : strBetween;
-    strText += Fill(strPattern, {{"name", Quoted(Names[Idx])}, {"i", std::to_string(Idx)}});
+    Words["name"] = Quoted(Names[Idx]);
+    Words["text"] = Literal(Names[Idx]);
+    Words["i"] = std::to_string(Idx);
+    strText += (Idx == 0 ? "" : strBetween) + Fill(strPattern, Words);
   }
   return strText;
 }
 
-std::string Quoted(const std::string& strName) {
-  std::string strQuoted = "\"";
+// Puts a name between quotes, and doubles those in it.
+static std::string InQuotes(char Quote, const std::string& strName) {
+  std::string strQuoted(1, Quote);
   for (const char Char : strName) {
-    strQuoted.append(Char == '"' ? 2 : 1, Char);
+    strQuoted.append(Char == Quote ? 2 : 1, Char);
   }
-  return strQuoted + '"';
+  return strQuoted + Quote;
 }
+
+std::string Quoted(const std::string& strName) { return InQuotes('"', strName); }
+
+std::string Literal(const std::string& strName) { return InQuotes('\'', strName); }
 
 std::string SameValue(const std::string& strA, const std::string& strB) {
   return strA + " IS " + strB + " COLLATE BINARY AND same_type(" + strA + ", " + strB + ")";

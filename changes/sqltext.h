@@ -11,9 +11,12 @@ using WordMap = std::map<std::string, std::string>;
 std::string Fill(const std::string& strPattern, const WordMap& Words);
 
 // Fills the pattern for each name and puts strBetween between the results. {name} is the name in
-// double quotes, {i} its place, from 0.
+// double quotes, {text} the name as a text, {i} its place, from 0; Words has all other words.
 std::string ForEach(const std::vector<std::string>& Names, const std::string& strPattern,
-                    const std::string& strBetween);
+                    const std::string& strBetween, WordMap Words = {});
+
+// Returns a name as a text in single quotes.
+std::string Literal(const std::string& strName);
 
 // Returns an identifier in double quotes.
 std::string Quoted(const std::string& strName);

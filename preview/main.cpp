@@ -1,229 +1,176 @@
 // Runs the tool on a copy of the appliance and shows what it changes there.
 
-#include <fcntl.h>
-#include <unistd.h>
+#include <sys/stat.h>
 
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
-#include <memory>
+#include <optional>
+#include <set>
 
-#include "capfiles.h"
-#include "compare.h"
+#include "cause.h"
+#include "changefile.h"
+#include "copy.h"
 #include "failure.h"
-#include "files.h"
+#include "keep.h"
 #include "options.h"
+#include "process.h"
 #include "report.h"
-#include "snapshot.h"
-#include "supervise.h"
 #include "tool.h"
-#include "undo.h"
+#include "value.h"
+
+namespace fs = std::filesystem;
 
 namespace {
 
-constexpr int WOULD_CHANGE = 3;
 constexpr int NO_PREVIEW = 2;
+constexpr int WOULD_CHANGE = 3;
 
-// Paths in the work directory, which is the current directory.
+// Names in the work directory, which is the current directory.
+constexpr const char* TARGET = "target";
 constexpr const char* BEFORE_DATABASE = "before.db";
 constexpr const char* AFTER_DATABASE = "target/system.db";
 constexpr const char* BEFORE_CAPS = "before";
 constexpr const char* AFTER_CAPS = "after";
-constexpr const char* UNDO_SQL = "undo.sql";
-constexpr const char* UNDO_PATCH = "undo.patch";
+constexpr const char* AFTER_CAPS_TARGET = "target/@camveld/@KICapInfo";
+constexpr const char* CHANGES = "changes";
 
-// Passes each change on to several sinks.
-class FanOut : public ChangeSink {
- public:
-  void Add(ChangeSink* pSink) { m_Sinks.push_back(pSink); }
-  void Cell(const TableRow& Before, const TableRow& After, size_t Column) override {
-    for (ChangeSink* pSink : m_Sinks) {
-      pSink->Cell(Before, After, Column);
-    }
-  }
-  void Added(const TableRow& After) override {
-    for (ChangeSink* pSink : m_Sinks) {
-      pSink->Added(After);
-    }
-  }
-  void Removed(const TableRow& Before) override {
-    for (ChangeSink* pSink : m_Sinks) {
-      pSink->Removed(Before);
-    }
-  }
-  void NotCompared(const std::string& strTable, const std::string& strWhat) override {
-    for (ChangeSink* pSink : m_Sinks) {
-      pSink->NotCompared(strTable, strWhat);
-    }
-  }
+std::string Absolute(const char* szName) { return fs::absolute(szName); }
 
- private:
-  std::vector<ChangeSink*> m_Sinks;
-};
-
-bool HasColour() {
-  const char* szNoColour = getenv("NO_COLOR");
-  return isatty(STDOUT_FILENO) == 1 && (szNoColour == nullptr || *szNoColour == '\0');
+int64_t InodeOf(const std::string& strFile) {
+  struct stat Stat;
+  if (stat(strFile.c_str(), &Stat) != 0) {
+    throw SystemFailure("cannot open " + strFile);
+  }
+  return static_cast<int64_t>(Stat.st_ino);
 }
 
-// Returns null for --check, which prints nothing.
-std::unique_ptr<Report> MakeReport(OutputMode Mode) {
-  switch (Mode) {
-    case OutputMode::TEXT:
-      return std::make_unique<TextReport>(HasColour());
-    case OutputMode::SUMMARY:
-      return std::make_unique<SummaryReport>();
-    case OutputMode::JSON:
-      return std::make_unique<JsonReport>();
-    default:
-      return nullptr;
-  }
-}
-
-// --- Steps of a preview ---
-
-// Reading lets SQLite roll back the journal, or apply the log, that a crash of the recorder left.
-void Recover(const std::string& strCopy) {
-  Database(strCopy, SQLITE_OPEN_READWRITE).Execute("SELECT count(*) FROM sqlite_schema");
-}
-
-void CopyAppliance(const CommandLine& Options, const Tool& Tool) {
-  CopyDatabase(Options.strDatabase, BEFORE_DATABASE);
-  Recover(BEFORE_DATABASE);
-  const Descriptor Before(OpenFile(BEFORE_DATABASE, O_RDONLY));
-  CopyTo(Before.Get(), BEFORE_DATABASE, AFTER_DATABASE, 0600);
-  std::filesystem::create_directory(BEFORE_CAPS);
-  std::filesystem::create_directory_symlink(Tool.CapDir(), AFTER_CAPS);
+// Copies the appliance, and describes the upgrade that the tool will make of the copy.
+Upgrade CopyAppliance(const CommandLine& Options, const Tool& Tool) {
+  CheckRoom(Options.strDatabase, Options.strCaps);
+  Upgrade Info;
+  Info.strVersion = Options.strVersion;
+  Info.strTool = Tool.File();
+  Info.strToolVersion = Tool.Banner();
+  Info.strDatabase = Options.strDatabase;
+  Info.Inode = InodeOf(Options.strDatabase);
+  Info.SchemaVersion = CopyDatabase(Options.strDatabase, Absolute(BEFORE_DATABASE));
+  Info.strTime = Database("", SQLITE_OPEN_READWRITE).Text("SELECT datetime() || ' UTC'");
+  CopyDatabase(Absolute(BEFORE_DATABASE), Absolute(AFTER_DATABASE));
+  fs::create_directory(BEFORE_CAPS);
+  fs::create_directories(AFTER_CAPS_TARGET);
+  fs::create_directory_symlink(AFTER_CAPS_TARGET, AFTER_CAPS);
   if (!Options.strCaps.empty()) {
     CopyCapFiles(Options.strCaps, BEFORE_CAPS);
     CopyCapFiles(BEFORE_CAPS, AFTER_CAPS);
   }
+  return Info;
 }
 
-void CompareDatabases(Report* pReport, Tally* pTally, UndoScript* pUndo) {
-  FanOut Sinks;
-  Sinks.Add(pTally);
-  if (pReport != nullptr) {
-    Sinks.Add(pReport);
-  }
-  if (pUndo != nullptr) {
-    Sinks.Add(pUndo);
-  }
-  Database Db(BEFORE_DATABASE, SQLITE_OPEN_READWRITE);
-  Db.Execute(std::string("ATTACH '") + AFTER_DATABASE + "' AS after");
-  Compare(Db, &Sinks, pUndo);
+std::string InDirectory(const char* szDir, const std::string& strName) {
+  return szDir + ("/" + strName);
 }
 
-void CompareCapFiles(Report* pReport, Tally* pTally, bool blUndo) {
-  std::string strPatch;
-  pTally->m_Files = 0;
-  for (const std::string& strName : ChangedFiles(BEFORE_CAPS, AFTER_CAPS)) {
-    const std::string strBefore = BEFORE_CAPS + ("/" + strName);
-    const std::string strAfter = AFTER_CAPS + ("/" + strName);
-    ++pTally->m_Files;
-    if (pReport != nullptr) {
-      const std::vector<std::string> Labels = {"--label=" + strBefore, "--label=" + strAfter};
-      pReport->File(strName, Diff(Labels, strBefore, strAfter));
-    }
-    if (blUndo) {
-      strPatch += Diff({}, strAfter, strBefore);
-    }
-  }
-  if (blUndo) {
-    WriteFile(UNDO_PATCH, strPatch);
-  }
-}
-
-void ReportFailures(const UpgradeRun& Upgrade, Report* pReport, Tally* pTally) {
-  pTally->m_Status = Upgrade.Status;
-  for (const FailedAction& Failed : Upgrade.Failures) {
-    pTally->m_Failed += Failed.blFile ? 0 : 1;
-    if (pReport != nullptr) {
-      pReport->Failed(Failed);
+// Adds the capability files that differ.
+void StoreFiles(const Database& Changes) {
+  for (const fs::directory_entry& Entry : fs::directory_iterator(BEFORE_CAPS)) {
+    const std::string strName = Entry.path().filename();
+    const std::string strBefore = ReadFile(Entry.path());
+    const std::string strAfter = ReadFile(InDirectory(AFTER_CAPS, strName));
+    if (strBefore != strAfter) {
+      AddFile(Changes, strName, strBefore, strAfter);
     }
   }
 }
 
+// Returns what diff(1) says of a capability file.
+std::string Diff(const std::string& strName) {
+  const std::string strBefore = InDirectory(BEFORE_CAPS, strName);
+  const std::string strAfter = InDirectory(AFTER_CAPS, strName);
+  const CommandResult Result =
+      RunCommand({"diff", "--unified", "--text", "--label=" + Name(strBefore),
+                  "--label=" + Name(strAfter), "--", strBefore, strAfter});
+  if (Result.Status != 1) {
+    throw Failure("cannot compare capability files: " +
+                  Result.strOutput.substr(0, Result.strOutput.find('\n')));
+  }
+  return Result.strOutput;
+}
+
+void ReportFailures(const std::vector<FailedAction>& Failures, Report* pReport) {
+  std::set<std::string> Actions;
+  for (const FailedAction& Failed : Failures) {
+    const std::string strCause = FindCause(Absolute(BEFORE_DATABASE), Failed.strSqlCmd);
+    pReport->Failed(Failed, strCause);
+    Actions.insert(Failed.strName);
+  }
+  pReport->m_Counts.Failed = static_cast<int64_t>(Actions.size());
+}
+
+// --check tells what is sure: a failure and a doubt win over a change.
+int CheckStatus(const Report& Report, bool blDoubt, int ToolStatus) {
+  if (ToolStatus != 0) {
+    return ToolStatus;
+  }
+  if (blDoubt) {
+    return NO_PREVIEW;
+  }
+  return Report.m_Counts.IsEmpty() ? 0 : WOULD_CHANGE;
+}
+
+int PreviewUpgrade(const CommandLine& Options) {
+  const Tool Tool(Options.strTool, Options.strOwnDir, TARGET);
+  std::optional<KeptFile> Kept;
+  if (!Options.strUndo.empty()) {
+    Kept.emplace(Options.strUndo);
+  }
+  const Upgrade Info = CopyAppliance(Options, Tool);
+  const UpgradeRun Run = Tool.Upgrade(Options.strVersion);
+  MakeChangeFile(Absolute(CHANGES), Absolute(BEFORE_DATABASE), Absolute(AFTER_DATABASE), Info);
+  const Database Changes(Absolute(CHANGES), SQLITE_OPEN_READWRITE);
+  StoreFiles(Changes);
+  if (Kept) {
+    Kept->Keep(CHANGES);
+  }
+
+  if (Options.Mode == OutputMode::TEXT || Options.Mode == OutputMode::SUMMARY) {
+    printf("%s (%s)\n", Name(Info.strToolVersion).c_str(), Name(Tool.File()).c_str());
+  }
+  Report Report(Changes, Options.Mode, !Options.strCaps.empty());
+  bool blDoubt = false;
+  for (const ChangedTable& Table : ReadTables(Changes)) {
+    Report.Table(Table);
+    blDoubt = blDoubt || Table.blDoubt;
+  }
+  Statement Files(Changes, "SELECT name FROM file ORDER BY name");
+  while (Files.Step()) {
+    Report.File(Files.Text(0), Diff(Files.Text(0)));
+  }
+  ReportFailures(Run.Failures, &Report);
+  Report.Summary(Run.Status);
+  return Options.Mode == OutputMode::CHECK ? CheckStatus(Report, blDoubt, Run.Status) : Run.Status;
+}
+
+// Without a database and without a package directory, every action fails, and says so.
 int ListActions(const CommandLine& Options) {
-  // There is no database here, so every action fails and the log names it.
-  const UpgradeRun Upgrade =
-      Tool(Options.strTool, Options.strOwnProgram, "target").Upgrade(Options.strVersion);
-  for (const FailedAction& Action : Upgrade.Failures) {
+  const UpgradeRun Run =
+      Tool(Options.strTool, Options.strOwnDir, TARGET).Upgrade(Options.strVersion);
+  for (const FailedAction& Action : Run.Failures) {
     puts(Action.strName.c_str());
-  }
-  if (Upgrade.CapActions > 0) {
-    printf("%d capability-file actions, which log no names\n", Upgrade.CapActions);
   }
   return 0;
 }
 
-int PreviewUpgrade(const CommandLine& Options) {
-  const Tool Tool(Options.strTool, Options.strOwnProgram, "target");
-  const std::unique_ptr<Report> pReport = MakeReport(Options.Mode);
-  std::unique_ptr<UndoDirectory> pUndoDirectory;
-  std::unique_ptr<UndoScript> pUndo;
-  if (!Options.strUndoDir.empty()) {
-    pUndoDirectory = std::make_unique<UndoDirectory>(Options.strUndoDir);
-    pUndo = std::make_unique<UndoScript>(UNDO_SQL, Options.strVersion);
-  }
-  CopyAppliance(Options, Tool);
-  if (Options.Mode == OutputMode::TEXT || Options.Mode == OutputMode::SUMMARY) {
-    puts(Tool.Describe().c_str());
-  }
-  const UpgradeRun Upgrade = Tool.Upgrade(Options.strVersion);
-  Tally Tally;
-  CompareDatabases(pReport.get(), &Tally, pUndo.get());
-  if (!Options.strCaps.empty()) {
-    CompareCapFiles(pReport.get(), &Tally, pUndo != nullptr);
-  } else if (pUndo != nullptr) {
-    WriteFile(UNDO_PATCH, "");
-  }
-  ReportFailures(Upgrade, pReport.get(), &Tally);
-  if (pReport != nullptr) {
-    pReport->Summary(Tally);
-  }
-  if (pUndo != nullptr) {
-    pUndo->Close();
-    pUndoDirectory->Deliver(UNDO_SQL, "system.db.sql");
-    pUndoDirectory->Deliver(UNDO_PATCH, "KICapInfo.patch");
-  }
-  return Options.Mode == OutputMode::CHECK && !Tally.IsEmpty() ? WOULD_CHANGE : Upgrade.Status;
-}
-
-// --- Failures ---
-
-// Returns the first error that SQLite's own check finds in the copy of the database.
-std::string FirstDamage() {
-  try {
-    const Database Db(BEFORE_DATABASE, SQLITE_OPEN_READWRITE);
-    Statement Check(Db, "PRAGMA integrity_check(1)");
-    std::string strDamage = Check.Step() ? Check.Text(0) : "";
-    if (strDamage.compare(0, 3, "***") == 0) {  // the first line names the database
-      strDamage = strDamage.substr(strDamage.find('\n') + 1);
-    }
-    return strDamage.substr(0, strDamage.find('\n'));
-  } catch (const Failure& Reason) {
-    return Reason.what();
-  }
-}
-
 int Fail(const std::string& strWhat) {
   fflush(stdout);
-  fprintf(stderr, "tessel-preview: %s\n", strWhat.c_str());
+  fprintf(stderr, "tessel-preview: %s\n", Name(strWhat).c_str());
   return NO_PREVIEW;
-}
-
-int FailDatabase(const CommandLine& Options, const SqlFailure& Reason) {
-  if (Reason.Code() == SQLITE_CORRUPT || Reason.Code() == SQLITE_NOTADB) {
-    return Fail(Options.strDatabase + " is damaged: " + FirstDamage());
-  }
-  return Fail(Options.strDatabase + ": " + Reason.what());
 }
 
 int Preview(const CommandLine& Options, const std::string& strWorkDir) {
   try {
-    std::filesystem::current_path(strWorkDir);
-    std::filesystem::create_directory("target");
+    fs::current_path(strWorkDir);
+    fs::create_directory(TARGET);
     setenv("LC_ALL", "C", 1);  // for the messages of other programs
     const int Status =
         Options.Mode == OutputMode::LIST ? ListActions(Options) : PreviewUpgrade(Options);
@@ -232,7 +179,7 @@ int Preview(const CommandLine& Options, const std::string& strWorkDir) {
     }
     return Status;
   } catch (const SqlFailure& Reason) {
-    return FailDatabase(Options, Reason);
+    return Fail(std::string("cannot compare the copies: ") + Reason.what());
   } catch (const std::exception& Reason) {
     return Fail(Reason.what());
   }
@@ -243,8 +190,8 @@ int Preview(const CommandLine& Options, const std::string& strWorkDir) {
 int main(int argc, char* argv[]) {
   try {
     const CommandLine Options = ParseOptions(argc, argv);
-    if (Options.blDone) {
-      return fflush(stdout) == 0 ? 0 : Fail("cannot write the output");
+    if (Options.Status >= 0) {
+      return fflush(stdout) == 0 ? Options.Status : Fail("cannot write the output");
     }
     return RunSupervised(
         [&](const std::string& strWorkDir) { return Preview(Options, strWorkDir); });

@@ -1,9 +1,8 @@
 #include "options.h"
 
 #include <getopt.h>
+#include <sys/stat.h>
 
-#include <algorithm>
-#include <cctype>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
@@ -11,47 +10,48 @@
 #include <limits>
 
 #include "failure.h"
-#include "files.h"
+
+namespace fs = std::filesystem;
 
 namespace {
 
 constexpr const char* DEFAULT_DATABASE = "/var/packages/Camveld/target/system.db";
+constexpr int MISUSED = 2;
 
 constexpr const char* HELP =
     "Usage: tessel-preview [OPTION]... [DATABASE] VERSION\n"
     "Shows what tesselupgrader would change when it replaces a package of version VERSION.\n"
     "DATABASE, by default the appliance's own, and the capability files stay as they are.\n"
     "\n"
-    "  --summary    print the counts alone\n"
-    "  --json       print an object a change, each on a line\n"
-    "  --list       name the actions that would run\n"
-    "  --check      print nothing; status 3 when something would change\n"
-    "  --undo DIR   write to DIR what takes the upgrade back\n"
-    "  --caps DIR   the capability files, by default @camveld/@KICapInfo beside DATABASE\n"
-    "  --tool FILE  the tesselupgrader to run, by default the newest of those at hand\n"
-    "  --help       print this\n"
-    "  --version    print the version\n"
+    "      --summary    print the counts alone\n"
+    "      --json       print an object a change, each on a line\n"
+    "      --list       name the actions that would run\n"
+    "      --check      print nothing; status 3 when something would change\n"
+    "      --undo FILE  keep the changes in FILE, for tessel-undo\n"
+    "      --caps DIR   the capability files, by default @camveld/@KICapInfo beside DATABASE\n"
+    "      --tool FILE  the tesselupgrader to run, by default the one beside this program\n"
+    "  -h, --help       print this\n"
+    "  -V, --version    print the version\n"
     "\n"
     "Status: the tool's (0, 255), 3 from --check, 2 when no preview could be made.\n";
 
-enum OptionCode { CAPS = 1, HELP_TEXT, PROGRAM_VERSION, TOOL, UNDO, FIRST_MODE };
+enum OptionCode { CAPS = 1, TOOL, UNDO, FIRST_MODE };
 
 constexpr option OPTION_LIST[] = {
     {"caps", required_argument, nullptr, CAPS},
-    {"help", no_argument, nullptr, HELP_TEXT},
-    {"version", no_argument, nullptr, PROGRAM_VERSION},
     {"tool", required_argument, nullptr, TOOL},
     {"undo", required_argument, nullptr, UNDO},
     {"summary", no_argument, nullptr, FIRST_MODE + static_cast<int>(OutputMode::SUMMARY)},
     {"json", no_argument, nullptr, FIRST_MODE + static_cast<int>(OutputMode::JSON)},
     {"list", no_argument, nullptr, FIRST_MODE + static_cast<int>(OutputMode::LIST)},
     {"check", no_argument, nullptr, FIRST_MODE + static_cast<int>(OutputMode::CHECK)},
+    {"help", no_argument, nullptr, 'h'},
+    {"version", no_argument, nullptr, 'V'},
     {nullptr, 0, nullptr, 0},
 };
 
 bool IsNumber(const std::string& strText) {
-  return !strText.empty() && std::all_of(strText.begin(), strText.end(),
-                                         [](unsigned char Char) { return isdigit(Char) != 0; });
+  return !strText.empty() && strText.find_first_not_of("0123456789") == std::string::npos;
 }
 
 void CheckVersion(const std::string& strVersion) {
@@ -59,12 +59,10 @@ void CheckVersion(const std::string& strVersion) {
   if (!IsNumber(strVersion)) {
     const bool blPackage = IsNumber(strNumber) && strVersion.size() > strNumber.size() + 1;
     throw Failure("not a version number: " + strVersion +
-                  (blPackage ? " (give the number behind the dash: " + strNumber + ")" : ""));
+                  (blPackage ? " (give the number after the last hyphen: " + strNumber + ")" : ""));
   }
-  const std::string strDigits =
-      strVersion.substr(std::min(strVersion.find_first_not_of('0'), strVersion.size() - 1));
-  if (strDigits.size() > 10 ||
-      strtoull(strDigits.c_str(), nullptr, 10) > std::numeric_limits<uint32_t>::max()) {
+  // A number beyond 64 bits gives the highest one.
+  if (strtoull(strVersion.c_str(), nullptr, 10) > std::numeric_limits<uint32_t>::max()) {
     throw Failure("version " + strVersion + " is beyond 32 bits");
   }
 }
@@ -76,94 +74,83 @@ void SetMode(OutputMode Mode, OutputMode* pMode) {
   *pMode = Mode;
 }
 
-void SetFile(const char* szName, const char* szValue, std::string* pFile) {
-  if (*szValue == '\0') {
-    throw Failure(std::string("option '--") + szName + "' needs a name");
+void SetPath(const char* szOption, std::string* pPath) {
+  if (*optarg == '\0') {
+    throw Failure(std::string("option '--") + szOption + "' needs a name");
   }
-  *pFile = szValue;
+  *pPath = fs::absolute(optarg);
 }
 
-void Print(CommandLine* pOptions, const char* szText) {
-  fputs(szText, stdout);
-  pOptions->blDone = true;
+std::string Resolved(const std::string& strFile) {
+  std::error_code Error;
+  const fs::path Path = fs::canonical(strFile, Error);
+  if (Error) {
+    throw Failure("cannot open " + strFile + ": " + Error.message());
+  }
+  return Path;
 }
 
-// By default, compares the capability files beside the database, if there are any.
+// By default, the capability files are beside the database as it was named, if there are any.
 void FindCaps(CommandLine* pOptions) {
-  const bool blBeside = pOptions->strCaps.empty();
-  if (blBeside) {
-    pOptions->strCaps =
-        std::filesystem::path(pOptions->strDatabase).parent_path() / "@camveld/@KICapInfo";
-  }
-  if (!IsDirectory(pOptions->strCaps)) {
-    if (!blBeside) {
-      throw Failure("no such directory: " + pOptions->strCaps);
+  const fs::path Beside = fs::path(pOptions->strDatabase).parent_path() / "@camveld/@KICapInfo";
+  if (!pOptions->strCaps.empty()) {
+    pOptions->strCaps = Resolved(pOptions->strCaps);
+    if (!fs::is_directory(pOptions->strCaps)) {
+      throw Failure(pOptions->strCaps + " is not a directory");
     }
-    pOptions->strCaps.clear();
+  } else if (std::error_code Error; fs::is_directory(Beside, Error)) {
+    pOptions->strCaps = Resolved(Beside);
   }
 }
 
-// Makes all paths absolute, because a preview changes to a directory of its own.
-void CompleteNames(CommandLine* pOptions) {
-  for (std::string* pFile :
-       {&pOptions->strDatabase, &pOptions->strCaps, &pOptions->strTool, &pOptions->strUndoDir}) {
-    if (!pFile->empty()) {
-      *pFile = std::filesystem::absolute(*pFile).lexically_normal();
-      if (pFile->size() > 1 && pFile->back() == '/') {
-        pFile->pop_back();
-      }
-    }
-  }
-}
-
-void SetPositional(int Count, char* szArguments[], CommandLine* pOptions) {
+void SetArguments(int Count, char* szArguments[], CommandLine* pOptions) {
   if (Count < 1 || Count > 2) {
     throw Failure(Count < 1 ? "VERSION is missing (--help says more)"
                             : std::string("too many arguments, from ") + szArguments[2] + " on");
   }
-  pOptions->strDatabase = Count == 2 ? szArguments[0] : DEFAULT_DATABASE;
   pOptions->strVersion = szArguments[Count - 1];
   CheckVersion(pOptions->strVersion);
+  if (pOptions->Mode != OutputMode::LIST) {
+    pOptions->strDatabase = fs::absolute(Count == 2 ? szArguments[0] : DEFAULT_DATABASE);
+    FindCaps(pOptions);
+    pOptions->strDatabase = Resolved(pOptions->strDatabase);
+    if (!fs::is_regular_file(pOptions->strDatabase)) {
+      throw Failure(pOptions->strDatabase + " is not a regular file");
+    }
+  } else if (Count == 2 || !pOptions->strUndo.empty() || !pOptions->strCaps.empty()) {
+    throw Failure("--list looks at no database and no file");
+  }
 }
 
 }  // namespace
 
 CommandLine ParseOptions(int argc, char* argv[]) {
   CommandLine Options;
-  int Option;
-  int Index = 0;
-  opterr = 0;
-  while ((Option = getopt_long(argc, argv, "", OPTION_LIST, &Index)) != -1) {
+  for (int Option; (Option = getopt_long(argc, argv, "hV", OPTION_LIST, nullptr)) != -1;) {
     switch (Option) {
-      case HELP_TEXT:
-        Print(&Options, HELP);
-        return Options;
-      case PROGRAM_VERSION:
-        Print(&Options, "tessel-preview " TESSEL_VERSION "\n");
+      case 'h':
+      case 'V':
+        fputs(Option == 'h' ? HELP : "tessel-preview " TESSEL_VERSION "\n", stdout);
+        Options.Status = 0;
         return Options;
       case CAPS:
-        SetFile("caps", optarg, &Options.strCaps);
+        SetPath("caps", &Options.strCaps);
         break;
       case TOOL:
-        SetFile("tool", optarg, &Options.strTool);
+        SetPath("tool", &Options.strTool);
         break;
       case UNDO:
-        SetFile("undo", optarg, &Options.strUndoDir);
+        SetPath("undo", &Options.strUndo);
         break;
-      case '?':
-        throw Failure(std::string("unknown, ambiguous or incomplete option: ") + argv[optind - 1] +
-                      " (--help says more)");
+      case '?':  // getopt_long has printed the reason
+        Options.Status = MISUSED;
+        return Options;
       default:
         SetMode(static_cast<OutputMode>(Option - FIRST_MODE), &Options.Mode);
         break;
     }
   }
-  if (Options.Mode == OutputMode::LIST && !Options.strUndoDir.empty()) {
-    throw Failure("--list changes nothing that --undo could take back");
-  }
-  SetPositional(argc - optind, argv + optind, &Options);
-  CompleteNames(&Options);
-  Options.strOwnProgram = std::filesystem::read_symlink("/proc/self/exe");
-  FindCaps(&Options);
+  SetArguments(argc - optind, argv + optind, &Options);
+  Options.strOwnDir = fs::read_symlink("/proc/self/exe").parent_path();
   return Options;
 }

@@ -1,204 +1,212 @@
 #include "report.h"
 
-#include <cinttypes>
 #include <cstdio>
 
+#include "sqltext.h"
 #include "value.h"
 
 namespace {
 
-constexpr const char* RED = "\033[31m";
-constexpr const char* GREEN = "\033[32m";
-constexpr const char* PLAIN = "\033[0m";
+// In all patterns, b is a row before the upgrade and a the same one after it, or b is a row of one
+// of both states. {i} is the place of a column, {text} its name.
+
+// For each row its keys and columns, and for each column a line if its cell has changed, else NULL.
+constexpr const char* CELLS = R"(
+  SELECT {keys}, {columns}, {lines} FROM before_{n} AS b JOIN after_{n} AS a ON {same_keys}
+  ORDER BY {keys})";
+
+constexpr const char* TEXT_CELL =
+    "' ' || shown_name({text}) || ': ' || shown(b.c{i}) || ' -> ' || shown(a.c{i})";
+
+constexpr const char* JSON_CELL = R"(
+  json_object('change', 'cell', {row} {camera}, 'column', value_json({text}),
+    'before', value_json(b.c{i}), 'after', value_json(a.c{i})))";
+
+constexpr const char* JSON_CAMERA =
+    ", 'vendor', value_json(b.c{vendor}), 'model', value_json(b.c{model})";
+
+// For each row of one state that the other lacks its keys, and one line.
+constexpr const char* ROWS = R"(
+  SELECT {keys}, {line} FROM {in}_{n} AS b
+  WHERE NOT EXISTS (SELECT 1 FROM {not_in}_{n} AS a WHERE {same_keys}) ORDER BY {keys})";
+
+constexpr const char* TEXT_ROW = R"(
+  ' {what}: ' || (WITH field (name, value) AS (VALUES {fields})
+    SELECT group_concat(shown_name(name) || '=' || shown(value), ', ') FROM field))";
+
+constexpr const char* JSON_ROW = R"(
+  json_object('change', '{what}', {row}, 'values', (WITH field (name, value) AS (VALUES {fields})
+    SELECT json_group_object(name_json(name), value_json(value)) FROM field)))";
+
+constexpr const char* TEXT_SUMMARY =
+    "{cells} cells in {cameras} cameras, {others} other cells, {added} rows added, "
+    "{removed} rows removed, ";
+
+constexpr const char* JSON_SUMMARY = R"(
+  SELECT json_object('change', 'summary', 'camera_cells', {cells}, 'cameras', {cameras},
+    'other_cells', {others}, 'rows_added', {added}, 'rows_removed', {removed}, 'files', {files},
+    'actions_failed', {failed}, 'status', {status}))";
+
+// The members "table" and "row": the value of the key, or an array if it has several columns.
+std::string JsonRow(const ChangedTable& Table) {
+  const std::string strKeys = ForEach(Table.Keys, "value_json(b.k{i})", ", ");
+  return "'table', value_json(" + Literal(Table.strName) + "), 'row', " +
+         (Table.Keys.size() == 1 ? strKeys : "json_array(" + strKeys + ")");
+}
+
+WordMap MakeWords(const ChangedTable& Table) {
+  return {{"n", std::to_string(Table.Number)},
+          {"row", JsonRow(Table)},
+          {"keys", Numbered("b.k", Table.Keys)},
+          {"columns", Numbered("b.c", Table.Columns)},
+          {"same_keys", ForEach(Table.Keys, "a.k{i} = b.k{i}", " AND ")},
+          {"fields", ForEach(Table.Columns, "({text}, b.c{i})", ", ")}};
+}
+
+std::string ShownName(sqlite3_value* pValue) {
+  return Name(reinterpret_cast<const char*>(sqlite3_value_text(pValue)));
+}
+
+template <std::string (*pFunction)(sqlite3_value*)>
+void TextFunction(sqlite3_context* pContext, int /*Count*/, sqlite3_value** ppValues) {
+  const std::string strText = pFunction(ppValues[0]);
+  sqlite3_result_text64(pContext, strText.data(), strText.size(), SQLITE_TRANSIENT, SQLITE_UTF8);
+}
 
 void Print(const std::string& strText) { fwrite(strText.data(), 1, strText.size(), stdout); }
 
-// Escapes control characters in a name of a table, column or file: they would break the line.
-std::string Name(const std::string& strName) {
-  std::string strShown;
-  for (const char Char : strName) {
-    const auto Byte = static_cast<unsigned char>(Char);
-    strShown += Byte < 0x20 || Byte == 0x7f ? "\\x" + Hex({Char}) : std::string{Char};
-  }
-  return strShown;
-}
-
-// "camera 12". If the primary key has several columns: "TABLE 'a', 2".
-std::string RowName(const TableRow& Row) {
-  const TableInfo& Table = Row.Table();
-  std::string strName = Name(Table.strName) + " ";
-  for (size_t Key = 0; Key < Table.Keys.size(); ++Key) {
-    strName += (Key == 0 ? "" : ", ") + Shown(Row.Key(Key));
-  }
-  return strName;
-}
-
-bool IsCamera(const TableInfo& Table) { return Table.Vendor != -1 && Table.Model != -1; }
-
-std::string Plain(sqlite3_value* pValue) {
-  return sqlite3_value_type(pValue) == SQLITE_TEXT ? Escaped(Bytes(pValue)) : Shown(pValue);
-}
-
-// " (VENDOR MODEL)" for a camera.
-std::string CameraName(const TableRow& Row) {
-  const TableInfo& Table = Row.Table();
-  if (!IsCamera(Table)) {
-    return "";
-  }
-  return " (" + Plain(Row.Column(static_cast<size_t>(Table.Vendor))) + " " +
-         Plain(Row.Column(static_cast<size_t>(Table.Model))) + ")";
-}
-
 }  // namespace
 
-// --- Counts ---
+Report::Report(const Database& Changes, OutputMode Mode, bool blCaps)
+    : m_Changes(Changes), m_Mode(Mode) {
+  m_Counts.Files = blCaps ? 0 : -1;
+  AddJsonFunctions(Changes);
+  for (const auto& [szName, pFunction] : {std::pair("shown", TextFunction<Shown>),
+                                          std::pair("shown_name", TextFunction<ShownName>)}) {
+    sqlite3_create_function(Changes.Get(), szName, 1, SQLITE_UTF8, nullptr, pFunction, nullptr,
+                            nullptr);
+  }
+}
 
-void Tally::Cell(const TableRow& Before, const TableRow& /*After*/, size_t /*Column*/) {
-  if (!IsCamera(Before.Table())) {
-    ++m_OtherCells;
+// Runs a statement that selects the keys of rows, perhaps their columns, and then lines or NULLs.
+// Prints the lines, and counts them.
+int64_t Report::PrintLines(const ChangedTable& Table, const std::string& strSql, bool blColumns,
+                           int64_t* pRows) const {
+  Statement Row(m_Changes, strSql);
+  const auto Columns = static_cast<int>(Table.Keys.size());
+  const int FirstLine = Columns + (blColumns ? static_cast<int>(Table.Columns.size()) : 0);
+  int64_t Lines = 0;
+  for (; Row.Step(); ++*pRows) {
+    const std::string strRow =
+        m_Mode == OutputMode::TEXT ? RowName(Table, Row, 0, blColumns ? Columns : -1) : "";
+    for (int Line = FirstLine; Line < sqlite3_column_count(Row.Get()); ++Line) {
+      if (sqlite3_value_type(Row.Value(Line)) == SQLITE_NULL) {
+        continue;
+      }
+      ++Lines;
+      if (m_Mode == OutputMode::TEXT || m_Mode == OutputMode::JSON) {
+        Print(strRow + Row.Text(Line) + "\n");
+      }
+    }
+  }
+  return Lines;
+}
+
+void Report::Table(const ChangedTable& Table) {
+  if (!Table.strReason.empty()) {
+    NotCompared(Table);
     return;
   }
-  // All changed cells of a row arrive together.
-  const int64_t Camera = sqlite3_value_int64(Before.Key(0));
-  m_Cameras += m_CameraCells == 0 || Camera != m_LastCamera ? 1 : 0;
-  m_LastCamera = Camera;
-  ++m_CameraCells;
+  const bool blJson = m_Mode == OutputMode::JSON;
+  const bool blCamera = Table.IsCamera();
+  WordMap Words = MakeWords(Table);
+  Words["camera"] = blCamera ? Fill(JSON_CAMERA, {{"vendor", std::to_string(Table.Vendor)},
+                                                  {"model", std::to_string(Table.Model)}})
+                             : "";
+  const std::string strCell = "CASE WHEN NOT (" + SameValue("a.c{i}", "b.c{i}") + ") THEN " +
+                              (blJson ? JSON_CELL : TEXT_CELL) + " END";
+  Words["lines"] = ForEach(Table.Columns, strCell, ", ", Words);
+  int64_t Rows = 0;
+  const int64_t Cells = PrintLines(Table, Fill(CELLS, Words), true, &Rows);
+  (blCamera ? m_Counts.CameraCells : m_Counts.OtherCells) += Cells;
+  m_Counts.Cameras += blCamera ? Rows : 0;
+
+  const auto PrintRows = [&](const char* szWhat, const char* szIn, const char* szNotIn) {
+    Words["what"] = szWhat;
+    Words["line"] = Fill(blJson ? JSON_ROW : TEXT_ROW, Words);
+    Words["in"] = szIn;
+    Words["not_in"] = szNotIn;
+    return PrintLines(Table, Fill(ROWS, Words), false, &Rows);
+  };
+  m_Counts.Removed += PrintRows("removed", "before", "after");
+  m_Counts.Added += PrintRows("added", "after", "before");
 }
 
-void Tally::Added(const TableRow& /*After*/) { ++m_Added; }
-
-void Tally::Removed(const TableRow& /*Before*/) { ++m_Removed; }
-
-bool Tally::IsEmpty() const {
-  return m_CameraCells + m_OtherCells + m_Added + m_Removed == 0 && m_Files <= 0;
-}
-
-// --- Summary ---
-
-void SummaryReport::Summary(const Tally& Counts) {
-  printf("%" PRId64 " cells in %" PRId64 " cameras, %" PRId64 " other cells, %" PRId64
-         " rows added, %" PRId64 " rows removed, ",
-         Counts.m_CameraCells, Counts.m_Cameras, Counts.m_OtherCells, Counts.m_Added,
-         Counts.m_Removed);
-  Print(Counts.m_Files == -1 ? "capability files not looked at"
-                             : std::to_string(Counts.m_Files) + " files changed");
-  printf(", %" PRId64 " actions failed\n", Counts.m_Failed);
-}
-
-// --- Text ---
-
-std::string TextReport::Coloured(const char* szColour, const std::string& strText) const {
-  return m_blColour ? szColour + strText + PLAIN : strText;
-}
-
-void TextReport::Cell(const TableRow& Before, const TableRow& After, size_t Column) {
-  Print(RowName(Before) + CameraName(Before) + " " + Name(Before.Table().Columns[Column].strName) +
-        ": " + Coloured(RED, Shown(Before.Column(Column))) + " -> " +
-        Coloured(GREEN, Shown(After.Column(Column))) + "\n");
-}
-
-void TextReport::PrintRow(const TableRow& Row, const char* szWhat, const char* szColour) const {
-  std::string strText = RowName(Row) + " " + szWhat + ":";
-  const TableInfo& Table = Row.Table();
-  for (size_t Column = 0; Column < Table.Columns.size(); ++Column) {
-    strText += (Column == 0 ? " " : ", ") + Name(Table.Columns[Column].strName) + "=" +
-               Shown(Row.Column(Column));
+void Report::NotCompared(const ChangedTable& Table) const {
+  if (Table.strName.compare(0, 7, "sqlite_") == 0 && !Table.blDoubt) {
+    return;  // SQLite's own bookkeeping
   }
-  Print(Coloured(szColour, strText) + "\n");
-}
-
-void TextReport::Added(const TableRow& After) { PrintRow(After, "added", GREEN); }
-
-void TextReport::Removed(const TableRow& Before) { PrintRow(Before, "removed", RED); }
-
-void TextReport::NotCompared(const std::string& strTable, const std::string& strWhat) {
-  Print("not compared: " + Name(strTable) + " (" + strWhat + ")\n");
-}
-
-void TextReport::File(const std::string& /*strName*/, const std::string& strDiff) {
-  Print(strDiff);
-}
-
-void TextReport::Failed(const FailedAction& Failed) {
-  Print(Coloured(RED, "failed: " + Name(Failed.strName) + ": " + Name(Failed.strReason)) + "\n");
-}
-
-// --- JSON ---
-
-namespace {
-
-std::string JsonMember(const char* szName, const std::string& strJson) {
-  return std::string(",\"") + szName + "\":" + strJson;
-}
-
-void PrintObject(const char* szChange, const std::string& strMembers) {
-  Print(std::string("{\"change\":\"") + szChange + "\"" + strMembers + "}\n");
-}
-
-// The name of the table, and the rowid or an array of the primary key's values.
-std::string JsonRowName(const TableRow& Row) {
-  const TableInfo& Table = Row.Table();
-  std::string strKey = Json(Row.Key(0));
-  for (size_t Key = 1; Key < Table.Keys.size(); ++Key) {
-    strKey += "," + Json(Row.Key(Key));
+  if (m_Mode == OutputMode::JSON) {
+    PrintObject("not compared", {{"table", Table.strName}, {"reason", Table.strReason}});
+    return;
   }
-  return JsonMember("table", JsonText(Table.strName)) +
-         JsonMember("row", Table.blHasRowid ? strKey : "[" + strKey + "]");
+  // --check has no output, but what it did not look at must be known.
+  fprintf(m_Mode == OutputMode::CHECK ? stderr : stdout, "not compared: %s (%s)\n",
+          Name(Table.strName).c_str(), Name(Table.strReason).c_str());
 }
 
-void PrintJsonRow(const TableRow& Row, const char* szChange) {
-  const TableInfo& Table = Row.Table();
-  std::string strValues;
-  for (size_t Column = 0; Column < Table.Columns.size(); ++Column) {
-    strValues += (Column == 0 ? "" : ",") + JsonText(Table.Columns[Column].strName) + ":" +
-                 Json(Row.Column(Column));
+// Prints an object with these texts as further members.
+void Report::PrintObject(const char* szChange,
+                         std::initializer_list<std::pair<const char*, std::string>> Texts) const {
+  std::string strMembers;
+  for (const auto& [szName, strText] : Texts) {
+    strMembers.append(", '").append(szName).append("', value_json(?)");
   }
-  PrintObject(szChange, JsonRowName(Row) + JsonMember("values", "{" + strValues + "}"));
-}
-
-}  // namespace
-
-void JsonReport::Cell(const TableRow& Before, const TableRow& After, size_t Column) {
-  const TableInfo& Table = Before.Table();
-  std::string strCamera;
-  if (IsCamera(Table)) {
-    strCamera = JsonMember("vendor", Json(Before.Column(static_cast<size_t>(Table.Vendor)))) +
-                JsonMember("model", Json(Before.Column(static_cast<size_t>(Table.Model))));
+  Statement Object(m_Changes, "SELECT json_object('change', ?" + strMembers + ")");
+  int Parameter = 1;
+  Object.Bind(Parameter++, std::string(szChange));
+  for (const auto& [szName, strText] : Texts) {
+    Object.Bind(Parameter++, strText);
   }
-  PrintObject("cell", JsonRowName(Before) + strCamera +
-                          JsonMember("column", JsonText(Table.Columns[Column].strName)) +
-                          JsonMember("before", Json(Before.Column(Column))) +
-                          JsonMember("after", Json(After.Column(Column))));
+  Object.Step();
+  Print(Object.Text(0) + "\n");
 }
 
-void JsonReport::Added(const TableRow& After) { PrintJsonRow(After, "added"); }
-
-void JsonReport::Removed(const TableRow& Before) { PrintJsonRow(Before, "removed"); }
-
-void JsonReport::NotCompared(const std::string& strTable, const std::string& strWhat) {
-  PrintObject("not compared",
-              JsonMember("table", JsonText(strTable)) + JsonMember("reason", JsonText(strWhat)));
+void Report::File(const std::string& strName, const std::string& strDiff) {
+  ++m_Counts.Files;
+  if (m_Mode == OutputMode::JSON) {
+    PrintObject("file", {{"name", strName}, {"diff", strDiff}});
+  } else if (m_Mode == OutputMode::TEXT) {
+    Print(strDiff);
+  }
 }
 
-void JsonReport::File(const std::string& strName, const std::string& strDiff) {
-  PrintObject("file",
-              JsonMember("name", JsonText(strName)) + JsonMember("diff", JsonText(strDiff)));
+void Report::Failed(const FailedAction& Failed, const std::string& strCause) const {
+  if (m_Mode == OutputMode::JSON) {
+    PrintObject("failed",
+                {{"action", Failed.strName}, {"reason", Failed.strReason}, {"enough", strCause}});
+  } else if (m_Mode == OutputMode::TEXT) {
+    const std::string strEnough = strCause.empty() ? "" : " (" + strCause + " alone is enough)";
+    Print("failed: " + Name(Failed.strName) + ": " + Name(Failed.strReason) + strEnough + "\n");
+  }
 }
 
-void JsonReport::Failed(const FailedAction& Failed) {
-  PrintObject("failed", JsonMember("action", JsonText(Failed.strName)) +
-                            JsonMember("reason", JsonText(Failed.strReason)));
-}
-
-void JsonReport::Summary(const Tally& Counts) {
-  const auto Number = [](int64_t Value) { return std::to_string(Value); };
-  PrintObject("summary",
-              JsonMember("camera_cells", Number(Counts.m_CameraCells)) +
-                  JsonMember("cameras", Number(Counts.m_Cameras)) +
-                  JsonMember("other_cells", Number(Counts.m_OtherCells)) +
-                  JsonMember("rows_added", Number(Counts.m_Added)) +
-                  JsonMember("rows_removed", Number(Counts.m_Removed)) +
-                  JsonMember("files", Counts.m_Files == -1 ? "null" : Number(Counts.m_Files)) +
-                  JsonMember("actions_failed", Number(Counts.m_Failed)) +
-                  JsonMember("status", Number(Counts.m_Status)));
+void Report::Summary(int Status) const {
+  const Counts& All = m_Counts;
+  const WordMap Words = {{"cells", std::to_string(All.CameraCells)},
+                         {"cameras", std::to_string(All.Cameras)},
+                         {"others", std::to_string(All.OtherCells)},
+                         {"added", std::to_string(All.Added)},
+                         {"removed", std::to_string(All.Removed)},
+                         {"files", All.Files == -1 ? "NULL" : std::to_string(All.Files)},
+                         {"failed", std::to_string(All.Failed)},
+                         {"status", std::to_string(Status)}};
+  if (m_Mode == OutputMode::JSON) {
+    Print(m_Changes.Text(Fill(JSON_SUMMARY, Words)) + "\n");
+  } else if (m_Mode != OutputMode::CHECK) {
+    Print(
+        Fill(TEXT_SUMMARY, Words) +
+        Fill(All.Files == -1 ? "capability files not looked at" : "{files} files changed", Words) +
+        Fill(", {failed} actions failed\n", Words));
+  }
 }

@@ -1,74 +1,53 @@
-// The output of a preview.
+// Prints what a change file holds.
 #pragma once
 
 #include <cstdint>
+#include <initializer_list>
 #include <string>
-#include <vector>
+#include <utility>
 
-#include "compare.h"
+#include "changefile.h"
+#include "database.h"
+#include "options.h"
 #include "tool.h"
 
-// Counts what changes.
-class Tally : public ChangeSink {
- public:
-  void Cell(const TableRow& Before, const TableRow& After, size_t Column) override;
-  void Added(const TableRow& After) override;
-  void Removed(const TableRow& Before) override;
-  bool IsEmpty() const;
+// How much a change file holds.
+struct Counts {
+  int64_t CameraCells = 0;
+  int64_t Cameras = 0;
+  int64_t OtherCells = 0;
+  int64_t Added = 0;
+  int64_t Removed = 0;
+  int64_t Files = -1;  // -1: there are no capability files
+  int64_t Failed = 0;  // actions
 
-  int64_t m_CameraCells = 0;
-  int64_t m_Cameras = 0;
-  int64_t m_OtherCells = 0;
-  int64_t m_Added = 0;
-  int64_t m_Removed = 0;
-  int64_t m_Files = -1;  // capability files that change; -1 if none were compared
-  int64_t m_Failed = 0;  // failed actions
-  int m_Status = 0;      // the exit status of the tool
+  bool IsEmpty() const { return CameraCells + OtherCells + Added + Removed == 0 && Files <= 0; }
+};
+
+// Counts and, as the mode says, prints. All functions throw SqlFailure.
+class Report {
+ public:
+  // Changes is the open change file.
+  Report(const Database& Changes, OutputMode Mode, bool blCaps);
+
+  // The changed cells, the removed and the added rows of a table, or why it is not compared.
+  void Table(const ChangedTable& Table);
+  // A changed capability file. strDiff shows how it changes.
+  void File(const std::string& strName, const std::string& strDiff);
+  // strCause is the row that is enough to make the action fail, if that is known.
+  void Failed(const FailedAction& Failed, const std::string& strCause) const;
+  // The last line. Status is the exit status of the tool.
+  void Summary(int Status) const;
+
+  Counts m_Counts;
 
  private:
-  int64_t m_LastCamera = 0;
-};
+  void NotCompared(const ChangedTable& Table) const;
+  int64_t PrintLines(const ChangedTable& Table, const std::string& strSql, bool blColumns,
+                     int64_t* pRows) const;
+  void PrintObject(const char* szChange,
+                   std::initializer_list<std::pair<const char*, std::string>> Texts) const;
 
-// Prints each change when it arrives.
-class Report : public ChangeSink {
- public:
-  virtual void File(const std::string& /*strName*/, const std::string& /*strDiff*/) {}
-  virtual void Failed(const FailedAction& /*Failed*/) {}
-  virtual void Summary(const Tally& Counts) = 0;
-};
-
-// Prints the summary only, as text.
-class SummaryReport : public Report {
- public:
-  void Summary(const Tally& Counts) override;
-};
-
-// Prints everything as text.
-class TextReport : public SummaryReport {
- public:
-  explicit TextReport(bool blColour) : m_blColour(blColour) {}
-  void Cell(const TableRow& Before, const TableRow& After, size_t Column) override;
-  void Added(const TableRow& After) override;
-  void Removed(const TableRow& Before) override;
-  void NotCompared(const std::string& strTable, const std::string& strWhat) override;
-  void File(const std::string& strName, const std::string& strDiff) override;
-  void Failed(const FailedAction& Failed) override;
-
- private:
-  void PrintRow(const TableRow& Row, const char* szWhat, const char* szColour) const;
-  std::string Coloured(const char* szColour, const std::string& strText) const;
-
-  const bool m_blColour;
-};
-
-// Prints everything as JSON Lines, one object per change.
-class JsonReport : public Report {
- public:
-  void Cell(const TableRow& Before, const TableRow& After, size_t Column) override;
-  void Added(const TableRow& After) override;
-  void Removed(const TableRow& Before) override;
-  void NotCompared(const std::string& strTable, const std::string& strWhat) override;
-  void File(const std::string& strName, const std::string& strDiff) override;
-  void Failed(const FailedAction& Failed) override;
-  void Summary(const Tally& Counts) override;
+  const Database& m_Changes;
+  const OutputMode m_Mode;
 };

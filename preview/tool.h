@@ -5,32 +5,37 @@
 #include <vector>
 
 struct FailedAction {
-  std::string strName;  // the action, or "capability file NAME"
+  std::string strName;
   std::string strReason;
-  bool blFile;
+  int Code = 0;           // SQLite's result code; 0 if the reason is not SQLite's
+  std::string strSqlCmd;  // the text that failed; empty if there is none
 };
 
 struct UpgradeRun {
-  int Status = 0;  // 0 or 255
-  std::vector<FailedAction> Failures;
-  int CapActions = 0;  // how many actions have read the capability directory
+  int Status = 0;                      // 0 or 255
+  std::vector<FailedAction> Failures;  // in the order in which they happened
 };
 
 // The tool, and the directory that it upgrades: TARGET/system.db and TARGET/@camveld/@KICapInfo,
-// with a log and a syslog of their own. All functions throw Failure.
+// with a log and a syslog of their own. The tool can write nothing else. All functions throw
+// Failure.
 class Tool {
  public:
-  // Uses strTool on the existing directory strTarget. If strTool is empty, uses the newest tool for
-  // this processor that is installed or built beside this program.
-  Tool(const std::string& strTool, const std::string& strOwnProgram, const std::string& strTarget);
+  // Uses strTool or, if that is empty, the tool in strOwnDir, the directory of this program.
+  // strTarget is short, because a socket in it needs a short name.
+  Tool(const std::string& strTool, const std::string& strOwnDir, const std::string& strTarget);
 
-  // "tesselupgrader VERSION (FILE)".
-  std::string Describe() const;
+  const std::string& File() const { return m_strTool; }
+
+  // What the tool calls itself: "tesselupgrader VERSION".
+  std::string Banner() const;
+
   UpgradeRun Upgrade(const std::string& strVersion) const;
-  std::string CapDir() const { return m_strTarget + "/@camveld/@KICapInfo"; }
 
  private:
+  std::vector<std::string> Command() const;
+
   std::string m_strTool;
   const std::string m_strTarget;
-  std::string m_strHelper;  // private-appliance
+  const std::string m_strHelper;  // private-appliance
 };

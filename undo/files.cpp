@@ -1,5 +1,7 @@
 #include "files.h"
 
+#include <unistd.h>
+
 #include <cstdio>
 #include <optional>
 #include <string_view>
@@ -17,80 +19,64 @@ Content Bytes(const Statement& Row, int Column) {
     return {};
   }
   const auto* pBytes = static_cast<const char*>(sqlite3_column_blob(Row.Get(), Column));
-  const auto Size = static_cast<size_t>(sqlite3_column_bytes(Row.Get(), Column));
-  return Size == 0 ? std::string_view() : std::string_view(pBytes, Size);
+  return std::string_view(pBytes, static_cast<size_t>(sqlite3_column_bytes(Row.Get(), Column)));
 }
 
-std::string Described(const Content& Bytes) {
+std::string Size(const Content& Bytes) {
   return Bytes ? std::to_string(Bytes->size()) + " bytes" : "none";
 }
 
-class File {
- public:
-  File(const std::string& strDir, const Statement& Row)
-      : m_strName(Row.Text(0)),
-        m_strFile(strDir + "/" + m_strName),
-        m_Before(Bytes(Row, 1)),
-        m_After(Bytes(Row, 2)) {}
+struct Change {
+  std::string strFile;
+  Content Before;
+  Content After;
+  std::string strNow;
+  Content Now;
+};
 
-  void Restore(bool blDryRun, Counts* pCounts) {
-    if (const std::string strReason = Try(blDryRun, pCounts); !strReason.empty()) {
-      ++pCounts->Left;
-      printf("left: file %s: before %s, after %s, now %s (%s)\n", Name(m_strName).c_str(),
-             Described(m_Before).c_str(), Described(m_After).c_str(), Described(m_Now).c_str(),
-             strReason.c_str());
-    }
+// Returns why the file is left, or "".
+std::string Restore(bool blDryRun, Change* pChange, Counts* pCounts) {
+  capfile::LockedFile File;
+  if (!blDryRun && File.Lock(pChange->strFile.c_str()) != 0) {
+    return SystemFailure(File.Step()).what();
   }
-
- private:
-  // Returns why the file is left, or "".
-  std::string Try(bool blDryRun, Counts* pCounts) {
-    capfile::LockedFile Locked;
-    if (m_strName.find('/') != std::string::npos) {
-      return "no name of a capability file";
-    }
-    if (!blDryRun && Locked.Lock(m_strFile.c_str()) != 0) {
-      return SystemFailure(Locked.Step()).what();
-    }
-    if (!ReadNow()) {
-      return SystemFailure("cannot be read").what();
-    }
-    if (m_Now == m_Before) {
-      ++pCounts->Done;
-      return "";
-    }
-    if (m_Now != m_After) {
-      return "it has been changed since";
-    }
-    if (!blDryRun && (m_Before ? Locked.Replace(*m_Before, m_Stat) : Locked.Remove()) != 0) {
-      return SystemFailure(Locked.Step()).what();
-    }
-    ++pCounts->Back;
+  struct stat Stat = {};
+  Stat.st_mode = 0644;  // of a file that comes back
+  Stat.st_uid = geteuid();
+  Stat.st_gid = getegid();
+  if (capfile::Read(pChange->strFile, &pChange->strNow, &Stat) == capfile::ReadResult::Read) {
+    pChange->Now = pChange->strNow;
+  } else if (errno != ENOENT) {
+    return SystemFailure("cannot be read").what();
+  }
+  if (pChange->Now == pChange->Before) {
+    ++pCounts->Done;
     return "";
   }
-
-  bool ReadNow() {
-    if (capfile::Read(m_strFile, &m_strNow, &m_Stat) == capfile::ReadResult::Read) {
-      m_Now = m_strNow;
-    }
-    return m_Now || errno == ENOENT;
+  if (pChange->Now != pChange->After) {
+    return "it has been changed since";
   }
-
-  const std::string m_strName;
-  const std::string m_strFile;
-  const Content m_Before;
-  const Content m_After;
-  std::string m_strNow;
-  Content m_Now;
-  struct stat m_Stat = {};
-};
+  if (!blDryRun && (pChange->Before ? File.Replace(*pChange->Before, Stat) : File.Remove()) != 0) {
+    return SystemFailure(File.Step()).what();
+  }
+  ++pCounts->Back;
+  return "";
+}
 
 }  // namespace
 
 void RestoreFiles(const Database& Changes, const std::string& strDir, bool blDryRun,
                   Counts* pCounts) {
-  Statement Files(Changes, "SELECT name, before, after FROM file ORDER BY name");
+  // A name with a slash would lead out of the directory.
+  Statement Files(Changes, "SELECT name, before, after FROM file WHERE name NOT LIKE '%/%'");
   while (Files.Step()) {
-    File(strDir, Files).Restore(blDryRun, pCounts);
+    Change Change = {strDir + "/" + Files.Text(0), Bytes(Files, 1), Bytes(Files, 2), "", {}};
+    const std::string strReason = Restore(blDryRun, &Change, pCounts);
+    if (!strReason.empty()) {
+      ++pCounts->Left;
+      printf("left: file %s: before %s, after %s, now %s (%s)\n", Name(Files.Text(0)).c_str(),
+             Size(Change.Before).c_str(), Size(Change.After).c_str(), Size(Change.Now).c_str(),
+             strReason.c_str());
+    }
   }
 }

@@ -161,20 +161,8 @@ void CopyTo(const Database& From, const Database& To) {
   }
 }
 
-// Returns the tables whose rows can go back.
-std::vector<TableUndo> ListTables(const Database& Db, const std::vector<ChangedTable>& Changed,
-                                  bool blRebuilt) {
-  std::vector<TableUndo> Tables;
-  for (const ChangedTable& Table : Changed) {
-    if (Table.strReason.empty()) {
-      Tables.emplace_back(Db, Table, blRebuilt);
-    }
-  }
-  return Tables;
-}
-
-// Takes back all rows that can go back, in an open transaction. A row that cannot, because of what
-// others have done since, shows only when all have: then another transaction leaves it.
+// Takes back all rows that can go back, and leaves the transaction open. A row that cannot, because
+// of what others have done since, shows only when all have: then another transaction leaves it.
 std::vector<TableUndo> TakeBack(const Database& Db, const Database& Original,
                                 const std::vector<ChangedTable>& Changed, int64_t SchemaVersion) {
   References References(Db);
@@ -182,10 +170,11 @@ std::vector<TableUndo> TakeBack(const Database& Db, const Database& Original,
   while (true) {
     Db.Execute("BEGIN IMMEDIATE");
     const bool blRebuilt = Original.Text("PRAGMA schema_version") != std::to_string(SchemaVersion);
-    std::vector<TableUndo> Tables = ListTables(Db, Changed, blRebuilt);
-    for (const TableUndo& Table : Tables) {
-      Table.Classify();
-      Table.Leave(Left);
+    std::vector<TableUndo> Tables;
+    for (const ChangedTable& Table : Changed) {
+      if (Table.strReason.empty()) {
+        Tables.emplace_back(Db, Table, blRebuilt).Classify(Left);
+      }
     }
     References.Prepare(Tables, &Left);
     const size_t Known = Left.size();

@@ -1,6 +1,5 @@
 #include "rows.h"
 
-#include <algorithm>
 #include <cinttypes>
 #include <cstdio>
 
@@ -19,14 +18,15 @@ constexpr const char* CREATE_LIST =
 // as before, because an upgrade can be killed.
 constexpr const char* LIST_CHANGED = R"(
   INSERT INTO temp.row_{n}
+  WITH counted AS MATERIALIZED (  -- so that each count is made once
+    SELECT {b_keys}, {counts} AS n, {rowid} AS now_r, CASE WHEN NOT {present} THEN 'the row is gone'
+      WHEN NOT ({same_camera}) THEN 'it is another camera now' END AS other
+    FROM changes.before_{n} AS b CROSS JOIN changes.after_{n} AS a ON {a_is_b}
+      LEFT JOIN main.{table} AS t ON {t_is_b})
   SELECT {keys}, 'changed', n % 1024, n / 1024 % 1024, n / 1048576 % 1024, n < 1048576, now_r,
     CASE WHEN other IS NULL AND n >= 1048576 AND NOT {is_camera}
       THEN 'the row has been changed since' ELSE other END
-  FROM (
-    SELECT b.*, {counts} AS n, {rowid} AS now_r, CASE WHEN NOT {present} THEN 'the row is gone'
-      WHEN NOT ({same_camera}) THEN 'it is another camera now' END AS other
-    FROM changes.before_{n} AS b CROSS JOIN changes.after_{n} AS a ON {a_is_b}
-      LEFT JOIN main.{table} AS t ON {t_is_b}))";
+  FROM counted)";
 
 constexpr const char* COUNT_CELL = R"(
   CASE WHEN {unchanged} THEN CASE WHEN {as_after} THEN 0 ELSE 1073741824 END
@@ -128,53 +128,47 @@ std::string CollatedKeys(const ChangedTable& Table) {
 }
 
 // In "camera", the same vendor and model make it the same row.
-bool IsCamera(const ChangedTable& Table) { return Table.Vendor != -1 && Table.Model != -1; }
-
 std::string SameCamera(const ChangedTable& Table) {
-  std::string strSql = "1";
-  for (const int Column : {Table.Vendor, Table.Model}) {
-    if (IsCamera(Table)) {
-      const WordMap Words = {{"name", Quoted(Table.Columns[static_cast<size_t>(Column)])},
-                             {"i", std::to_string(Column)}};
-      strSql += Fill(" AND (" + SameValue("t.{name}", "a.c{i}") + " OR " +
-                         SameValue("t.{name}", "b.c{i}") + ")",
-                     Words);
-    }
-  }
-  return strSql;
+  const auto Same = [&](int Column) {
+    const std::string strNow = "t." + Quoted(Table.Columns[static_cast<size_t>(Column)]);
+    const std::string strIdx = std::to_string(Column);
+    return "(" + SameValue(strNow, "a.c" + strIdx) + " OR " + SameValue(strNow, "b.c" + strIdx) +
+           ")";
+  };
+  return Table.IsCamera() ? Same(Table.Vendor) + " AND " + Same(Table.Model) : "1";
 }
 
 // True if the rows have a rowid that no column holds.
 bool HasOwnRowid(const ChangedTable& Table) {
-  const auto& Columns = Table.Columns;
-  return !Table.strRowid.empty() &&
-         std::find(Columns.begin(), Columns.end(), Table.strRowid) == Columns.end();
+  return !Table.strRowid.empty() && FindName(Table.Columns, Table.strRowid) == -1;
 }
 
 WordMap MakeWords(const ChangedTable& Table) {
   const std::vector<std::string>& Columns = Table.Columns;
   const bool blRowid = HasOwnRowid(Table);
   const std::string strRowid = blRowid ? Quoted(Table.strRowid) : "";
+  const std::string strPresent = "(t." + Quoted(Table.Keys[0]) + " IS NOT NULL)";
   const WordMap Cell = {
       {"unchanged", SameValue("a.c{i}", "b.c{i}")},
       {"as_after", SameValue("t.{name}", "a.c{i}")},
       {"as_before", SameValue("t.{name}", "b.c{i}")},
-      {"present", "(t." + Quoted(Table.Keys[0]) + " IS NOT NULL)"},
+      {"present", "{present}"},
       {"i", "{i}"},
       {"now", "t.{name}"},
       {"before", "b.c{i}"},
   };
   const auto EachCell = [&](const char* szPattern, const char* szBetween) {
-    return ForEach(Columns, Fill(szPattern, Cell), szBetween);
+    return ForEach(Columns, Fill(szPattern, Cell), szBetween, {{"present", strPresent}});
   };
   return {
       {"n", std::to_string(Table.Number)},
       {"table", Quoted(Table.strName)},
       {"goes_back", GOES_BACK},
-      {"present", Cell.at("present")},
-      {"is_camera", IsCamera(Table) ? "1" : "0"},
+      {"present", strPresent},
+      {"is_camera", Table.IsCamera() ? "1" : "0"},
       {"same_camera", SameCamera(Table)},
       {"keys", Numbered("k", Table.Keys)},
+      {"b_keys", Numbered("b.k", Table.Keys)},
       {"x_keys", Numbered("x.k", Table.Keys)},
       {"collated_keys", CollatedKeys(Table)},
       {"a_is_b", SameStored(Table, "a", "b")},
@@ -192,9 +186,9 @@ WordMap MakeWords(const ChangedTable& Table) {
       {"merged", EachCell(MERGE_CELL, ", ")},
       {"marks", EachCell(MARK_CELL, " || ")},
       {"rowid", blRowid ? "t." + strRowid : "0"},
-      {"old_rowid", !blRowid            ? "0"
-                    : Table.blRowidOnly ? "k0"
-                                        : "r"},
+      {"old_rowid", Table.blRowidOnly ? "k0"
+                    : blRowid         ? "r"
+                                      : "0"},
       {"columns", (blRowid ? strRowid + ", " : "") + ForEach(Columns, "{name}", ", ")},
       {"values", (blRowid ? "x.r, " : "") + Numbered("b.c", Columns)},
   };
@@ -207,7 +201,7 @@ TableUndo::TableUndo(const Database& Db, const ChangedTable& Table, bool blRebui
 
 std::string TableUndo::FindReason(bool blRebuilt) const {
   Statement Definition(m_Db,
-                       "SELECT sql FROM main.sqlite_schema WHERE type = 'table' AND name = ?");
+                       "SELECT sql FROM main.sqlite_schema WHERE name = ? AND type = 'table'");
   Definition.Bind(1, m_Table.strName);
   if (!Definition.Step() || Definition.Text(0) != m_Table.strDefinition) {
     return "its definition has been changed since";
@@ -224,13 +218,14 @@ std::string TableUndo::FindReason(bool blRebuilt) const {
   }
 }
 
-void TableUndo::Classify() const {
+void TableUndo::Classify(const std::vector<LeftRow>& Left) const {
   Execute(CREATE_LIST);
   if (m_strReason.empty()) {
     Execute(LIST_CHANGED);
     Execute(LIST_ADDED);
     Execute(LIST_REMOVED);
   }
+  Leave(Left);
 }
 
 void TableUndo::Leave(const std::vector<LeftRow>& Left) const {

@@ -44,10 +44,8 @@ class TableUndo {
 
   const ChangedTable& Table() const { return m_Table; }
 
-  // Creates row_N.
-  void Classify() const;
-
-  // Leaves the rows of Left that belong to this table.
+  // Creates row_N. Leaves the rows of Left that belong to this table, as Leave does.
+  void Classify(const std::vector<LeftRow>& Left) const;
   void Leave(const std::vector<LeftRow>& Left) const;
 
   // Takes back what goes back. All rows go before the first comes back, because SQLite checks

@@ -48,7 +48,15 @@ STATUSES = [
     # program, arguments that lead to each status of its man page
     (TOOL, ["99999", "", "0"]),
     (KIDBGLOG, ["--help", "show", "--nonsense"]),
-    (PREVIEW, ["--help", "-x", "--tool {} --check {} 0", "--tool {} {} 0"]),
+    (
+        PREVIEW,
+        [
+            "--help",
+            "-x",
+            "--tool {} --check {} 0",
+            "--tool {} --check {}.old 0",
+        ],
+    ),
 ]
 
 
@@ -63,7 +71,10 @@ def options(text):
 
 @pytest.mark.parametrize("program, commands", STATUSES)
 def test_man_page_is_right(appliance, tmp_path, program, commands):
-    appliance.database.touch()  # all actions will fail
+    appliance.load_example()
+    # A database on which no action fails, and one on which all do.
+    appliance.database.rename(f"{appliance.database}.old")
+    appliance.database.touch()
     appliance.capability_file("camera", "pan=yes\n")
     tool = appliance.script(tmp_path / "tool", TOOL)
     page = (SOURCE / f"docs/{program.split('/')[1]}.8").read_text()

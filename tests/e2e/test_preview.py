@@ -1,4 +1,4 @@
-"""What tessel-preview shows and writes; it leaves all else as it was."""
+"""What tessel-preview shows and keeps; it leaves all else as it was."""
 
 import json
 import os
@@ -6,13 +6,16 @@ import re
 import shutil
 import sqlite3
 import subprocess
+from contextlib import closing
+from pathlib import Path
 
 import pytest
-from conftest import PREVIEW, TOOL, run
+from conftest import PREVIEW, SOURCE, STRACE, TOOL, run
+from test_migrations import tables
 
 # Names and values of all kinds, which a trigger changes in turn.
 AWKWARD = r"""
-    CREATE TABLE "o'd ""tab"" 1" (rowid, "a b" UNIQUE, c AS (rowid+1), d);
+    CREATE TABLE "o'd ""tab"" 1" (rowid, "a b" UNIQUE, d);
     INSERT INTO "o'd ""tab"" 1" (rowid, "a b", d) VALUES
       (1, x'00ff', CAST(x'ff41' AS TEXT)), (NULL, 1.5, 'x'),
       (7, CAST(x'410042' AS TEXT), '');
@@ -20,14 +23,14 @@ AWKWARD = r"""
       WITHOUT ROWID;
     INSERT INTO pairs VALUES ('x', 1, 0.1 + 0.2), ('y', 1, NULL), ('Z', 2, 3);
     CREATE TABLE added (id INTEGER PRIMARY KEY AUTOINCREMENT, v);
-    INSERT INTO added (v) VALUES (1);
+    CREATE VIEW seen AS SELECT 1;
     CREATE TRIGGER t AFTER UPDATE ON camera WHEN new.vendor = 'SIEMENS' BEGIN
       UPDATE "o'd ""tab"" 1" SET rowid = x'01', d = d || CAST(x'c3' AS TEXT);
       UPDATE "o'd ""tab"" 1" SET "a b" = 'it''s \' WHERE "a b" = 1.5;
-      UPDATE pairs SET a = upper(a), v = 1e300 / 7 WHERE b = 1;
+      UPDATE pairs SET v = 1e300 / 7 WHERE b = 1;
       DELETE FROM pairs WHERE b = 2;
-      INSERT INTO added (v) VALUES (NULL), (-9223372036854775807 - 1),
-        (1e-300 / 3), (char(0, 13, 10, 34, 39, 92)), (x''), (x'00ff');
+      INSERT INTO added (v) VALUES (NULL), (-9223372036854775807 - 1), (9e999),
+        (1e-300 / 3), (char(0, 13, 10, 34, 39, 92, 233)), (x''), (x'00ff');
     END;"""
 
 
@@ -38,7 +41,7 @@ def preview(example, tmp_path):
     temporary = tmp_path / "tmp"
     temporary.mkdir()
 
-    def run_preview(*arguments, under=(), status=0):
+    def run_preview(*arguments, under=(), status=0, tool=tool):
         before = everything(example)
         command = example.command(PREVIEW, "--tool", tool, *arguments)
         ended = run("env", f"TMPDIR={temporary}", *under, *command)
@@ -50,14 +53,20 @@ def preview(example, tmp_path):
     return run_preview
 
 
+@pytest.fixture
+def kept():
+    """The name of a change file, in a directory of its own."""
+    directory = Path("/var/kept")
+    directory.mkdir(mode=0o700)
+    return directory / "from-0"
+
+
 def everything(example):
-    sequences = example.sql("SELECT * FROM sqlite_sequence")
-    return example.rows(), sequences, example.capability_files()
+    return example.rows(), example.capability_files()
 
 
 def test_shows_what_the_upgrade_then_changes(example, preview):
     text = preview(0)
-    objects = preview("--json", 0).splitlines()
     upgrade = example.upgrade(0)
     shown = re.findall("^.*: .* -> .*|^.* added: .*", text, re.M)
     assert sorted(shown) == sorted(upgrade.changes)
@@ -70,66 +79,93 @@ def test_shows_what_the_upgrade_then_changes(example, preview):
         f"0 other cells, {added} rows added, 0 rows removed, "
         f"{files} files changed, 0 actions failed\n"
     )
-    *changes, summary = map(json.loads, objects)
-    assert summary["camera_cells"] == len(cells)
-    line = "camera {row} ({vendor} {model}) {column}: {before!r} -> {after!r}"
-    cell = next(change for change in changes if change["change"] == "cell")
-    assert line.format(**cell) in cells
 
 
-def undo(example):
-    """Returns the last line that the script prints, which counts."""
-    script = example.directory / "undo/system.db.sql"
-    command = ["sqlite3", example.database, f".read {script}"]
-    return subprocess.check_output(command, text=True).splitlines()[-1]
+def escaped(match):
+    return f"\\x{ord(match[0]):02x}"
 
 
-def test_undo_sets_everything_back(example, preview):
-    example.sql(AWKWARD)
-    before = everything(example)
-    preview("--undo", example.directory / "undo", 0)
-    run(*example.command(TOOL, 0))
-    assert everything(example) != before
-    done = undo(example)
-    patch = example.directory / "undo/KICapInfo.patch"
-    command = ["patch", "-s", "-p1", "-d", example.caps, "-i", patch]
-    subprocess.check_call(command)
-    assert everything(example) == before
-    count = done.split()[0]
-    left = "0 changed since and left"
-    assert done == f"{count} set back, {left}, 0 already as before"
-    assert undo(example).endswith(f"{left}, {count} already as before")
-    assert everything(example) == before
+def shown(value):
+    """A value of the JSON output as the text shows it."""
+    match value:
+        case None:
+            return "NULL"
+        case {"blob": digits}:
+            return f"x'{digits}'"
+        case {"real": name}:
+            return name.lower()
+        case str() | {"text": _}:
+            is_text = isinstance(value, str)
+            raw = value.encode() if is_text else bytes.fromhex(value["text"])
+            raw = re.sub(rb"(['\\])", rb"\\\1", raw).decode("latin-1")
+            return "'" + re.sub("[^ -~]", escaped, raw) + "'"
+        case _:
+            return str(value)
 
 
-def test_undo_keeps_what_somebody_else_has_changed_since(example, preview):
-    before = example.rows()
-    preview("--undo", example.directory / "undo", 0)
-    changes = len(example.upgrade(0).changes)
-    example.sql("UPDATE camera SET model = 'MINE' WHERE id = 10")
-    example.sql("UPDATE camdeviceoutput SET name = 'Gate' WHERE id = 12")
-    before["camera", 10]["model"] = "MINE"
-    before["camdeviceoutput", 12] = example.rows()["camdeviceoutput", 12]
-    done = undo(example)
-    assert done.startswith(f"{changes - 2} set back, 2 changed since and left")
-    assert example.rows() == before
+def line_of(change):
+    """An object of the JSON output as a line of the text."""
+    match change:
+        case {"change": "not compared"}:
+            return "not compared: {table} ({reason})".format(**change)
+        case {"change": "file"}:
+            return change["diff"].removesuffix("\n")
+        case {"change": "failed"}:
+            return "failed: {action}: {reason}".format(**change)
+    row = change["row"] if isinstance(change["row"], list) else [change["row"]]
+    start = f"{change['table']} {', '.join(map(shown, row))}"
+    if change["change"] != "cell":
+        cells = [f"{k}={shown(v)}" for k, v in change["values"].items()]
+        return f"{start} {change['change']}: {', '.join(cells)}"
+    if change["table"] == "camera":
+        start += f" ({change['vendor']} {change['model']})"
+    cells = shown(change["before"]), shown(change["after"])
+    return f"{start} {change['column']}: {' -> '.join(cells)}"
 
 
-@pytest.mark.parametrize("mode", ["delete", "wal"])
+@pytest.mark.parametrize("encoding", ["UTF-8", "UTF-16be"])
+def test_json_says_the_same_as_the_text(example, preview, encoding):
+    example.database.unlink()
+    text = (SOURCE / "examples/appliance.sql").read_text()
+    example.sql(f"PRAGMA encoding = '{encoding}'; {text} {AWKWARD}")
+    example.sql("ALTER TABLE camera RENAME audio_format TO sound")
+    tool, *lines, _ = preview(0, status=255).splitlines()
+    assert "tesselupgrader " in tool
+    *changes, summary = preview("--json", 0, status=255).splitlines()
+    changes = [line_of(json.loads(change)) for change in changes]
+    assert "\n".join(changes).splitlines() == lines
+    assert "not compared: seen (view)" in lines
+    summary = json.loads(summary)
+    counted = [line for line in lines if re.match("camera .* -> ", line)]
+    assert summary["camera_cells"] == len(counted)
+    assert (summary["actions_failed"], summary["status"]) == (1, 255)
+
+
+@pytest.mark.parametrize("mode", ["delete", "wal", "wal without shm"])
+@pytest.mark.parametrize("name", ["system.db", "link.db", "link/../system.db"])
 def test_a_crashed_database_is_seen_as_committed(
-    example, preview, tmp_path, mode
+    example, tmp_path, mode, name
 ):
-    example.sql(f"PRAGMA journal_mode = {mode}")
-    example.sql("UPDATE camera SET resolution = 'VGA' WHERE id = 3")
+    example.sql(f"PRAGMA journal_mode = {mode.split()[0]}")
     writer = sqlite3.connect(example.database)
+    writer.execute("UPDATE camera SET resolution = 'VGA' WHERE id = 3")
+    writer.commit()
     # Too much for the cache: part of the transaction is in the files.
     writer.execute("PRAGMA cache_size = 5")
     writer.execute("UPDATE camera SET motion_area = zeroblob(3000)")
     writer.execute("UPDATE camera SET resolution = 'QVGA'")
+    crashed = tmp_path / "crashed"
+    (crashed / "below").mkdir(parents=True)
     for file in example.directory.glob("system.db*"):
-        shutil.copy(file, tmp_path)
+        shutil.copy(file, crashed)
     writer.close()
-    shown = preview(tmp_path / "system.db", 0)
+    if "without" in mode:
+        (crashed / "system.db-shm").unlink()
+    (tmp_path / "link.db").symlink_to(crashed / "system.db")
+    (tmp_path / "link").symlink_to(crashed / "below")
+    path = crashed / name if name == "system.db" else f"{tmp_path}/{name}"
+    tool = example.script(tmp_path / "tool", TOOL)
+    shown = run(*example.command(PREVIEW, "--tool", tool, path, 0)).stdout
     change = "camera 3 (Eyseo TVIP62000) resolution: 'VGA' -> '640x480'"
     assert change in shown
 
@@ -138,29 +174,137 @@ def test_a_failed_action_has_its_name_and_the_reason(example, preview):
     example.sql("ALTER TABLE camera RENAME audio_format TO sound")
     output = preview(364, status=255)
     reason = "UpdateTrendNetAdoFmt: no such column: audio_format"
-    assert f"\nfailed: {reason}\n" in output
+    assert f"\nfailed: {reason}" in output
     assert output.endswith(", 1 actions failed\n")
 
 
-def test_check_tells_whether_anything_is_left(example, preview):
-    assert preview("--check", 2401, status=3) == ""
-    example.upgrade(2401)
-    assert preview("--check", 2401) == ""
+CHECKS = [
+    # what is done to the database, version, status, what is said
+    ("", 2475, 0, ""),
+    ("", 2401, 3, ""),
+    ("ALTER TABLE camera RENAME audio_format TO sound", 364, 255, ""),
+    (
+        "CREATE TABLE t (a COLLATE theirs PRIMARY KEY) WITHOUT ROWID",
+        2401,
+        2,
+        "not compared: t (no such collation sequence: theirs)\n",
+    ),
+]
+
+
+@pytest.mark.parametrize("change, version, status, said", CHECKS)
+def test_check_tells_what_is_sure(
+    example, preview, change, version, status, said
+):
+    with closing(sqlite3.connect(example.database)) as database:
+        database.create_collation("theirs", lambda a, b: 0)
+        database.executescript(change)
+    assert preview("--check", version, status=status) == said
+
+
+def test_list_names_the_actions_in_their_order(preview):
+    rows = [name for table in tables() for _, name in table]
+    assert preview("--list", 0).split() == rows
+    assert preview("--list", 2474).split() == rows[-3:-2]
+
+
+def other_tool(tmp_path, commands):
+    """A tool that runs commands in the place of an upgrade."""
+    tool = tmp_path / "other-tool"
+    tool.write_text(f"#!/bin/sh\n[ $# = 1 ] || exit 1\n{commands}\n")
+    tool.chmod(0o755)
+    return tool
 
 
 def test_a_signal_leaves_nothing_behind(preview, tmp_path):
-    (tmp_path / "tool").write_text("#!/bin/sh\nexec sleep 60\n")
-    preview(0, under=["timeout", "--preserve-status", "1"], status=143)
+    tool = other_tool(tmp_path, "exec sleep 68.5")
+    under = "timeout --preserve-status --foreground 1".split()
+    preview(0, under=under, status=143, tool=tool)
+    assert run("pgrep", "-f", "sleep 68.5").stdout == ""
+
+
+def test_the_tool_writes_nothing_but_its_copies(preview, tmp_path):
+    outside = tmp_path / "outside"
+    outside.mkdir()
+    files = f"{outside}/file /dev/shm/file /var/packages/Camveld/target/file"
+    preview(0, tool=other_tool(tmp_path, f"touch {files}; exit 0"))
+    assert not os.listdir(outside) + list(Path("/dev/shm").glob("file"))
+
+
+def test_programs_and_copies_may_be_below_var(example, kept):
+    sbin, libexec = "/var/programs/sbin", "/var/programs/libexec"
+    Path(sbin).mkdir(parents=True)
+    shutil.copy(example.build / PREVIEW, sbin)
+    shutil.copy(example.build / TOOL, sbin)
+    shutil.copytree(example.build / "libexec", libexec)
+    tool = example.script(Path("/var/programs/tool"), TOOL)
+    options = ["--tool", tool] if example.emulator else []
+    command = [*example.emulator, f"{sbin}/tessel-preview", *options, "0"]
+    ended = run("env", "TMPDIR=/var/programs", *command)
+    assert (ended.returncode, ", 0 actions failed" in ended.stdout) == (
+        0,
+        True,
+    )
+
+
+def test_the_change_file_is_complete_before_the_first_line(example, kept):
+    tool = example.script(kept.parent / "tool", TOOL)
+    options = ["--tool", tool, "--undo", kept]
+    command = example.command(PREVIEW, *options, "0")
+    with subprocess.Popen(command, stdout=subprocess.PIPE) as process:
+        process.stdout.readline()
+        process.kill()
+    assert kept.stat().st_mode & 0o777 == 0o600
+    with closing(sqlite3.connect(kept)) as changes:
+        files = changes.execute("SELECT count(*) FROM file").fetchone()
+    assert files == (example.upgrade(0).diffs.count("--- "),)
+
+
+FULL = "head -c 9M /dev/zero >/var/packages/Camveld/target/file 2>/dev/null"
+ROOM = [
+    # MB in TMPDIR, what fills it, what is said
+    (1, ":", "TMPDIR needs 2 MB, has 1"),
+    (3, FULL, "the copy cannot be upgraded: "),
+]
+
+
+@pytest.mark.parametrize("room, fill, said", ROOM)
+def test_too_little_room_is_no_failure_of_the_upgrade(
+    example, preview, tmp_path, kept, room, fill, said
+):
+    tool = example.script(tmp_path / "real-tool", TOOL)
+    tool = other_tool(tmp_path, f'{fill}; exec {tool} "$@"')
+    size = f"size={room}m"
+    mount = ["mount", "-t", "tmpfs", "-o", size, "tmpfs", tmp_path / "tmp"]
+    subprocess.check_call(mount)
+    try:
+        output = preview("--undo", kept, 0, tool=tool, status=2)
+    finally:
+        subprocess.check_call(["umount", tmp_path / "tmp"])
+    assert said in output
+    assert not os.listdir(kept.parent)
+
+
+def test_a_change_file_that_cannot_be_synced_is_not_kept(preview, kept):
+    error = ["-e", "inject=fsync:error=EIO", "-P", f"{kept}.part"]
+    said = preview("--undo", kept, 0, under=[*STRACE, "-f", *error], status=2)
+    assert said == f"tessel-preview: cannot write {kept}: Input/output error\n"
+    assert not os.listdir(kept.parent)
 
 
 MESSAGES = [
-    ("--colour 0", "option: --colour (--help says more)"),
+    ("--colour 0", "unrecognized option '--colour'"),
     ("4294967296", "version 4294967296 is beyond 32 bits"),
-    ("8.2.0-2401", "8.2.0-2401 (give the number behind the dash: 2401)"),
-    ("{}/@camveld 0", "@camveld is a directory, not a database"),
-    ("--undo {0}/@camveld {0}/system.db 0", "@camveld is not empty"),
-    ("{}/text 0", "text is damaged: file is not a database"),
-    ("{}/torn 0", "torn is damaged: "),
+    ("8.2.0-2401", "8.2.0-2401 (give the number after the last hyphen: 2401)"),
+    ("{}/@camveld 0", "@camveld is not a regular file"),
+    ("{}/none 0", "none: No such file or directory"),
+    ("{}/text 0", "text: file is not a database"),
+    ("--undo {}/text {}/system.db 0", "text exists already"),
+    ("--undo {}/open/new {}/system.db 0", "others can write the directory"),
+    ("--undo {}/link/new {}/system.db 0", "link is a link"),
+    ("--caps {}/text {}/system.db 0", "text is not a directory"),
+    ("--tool {}/text {}/system.db 0", "cannot run {}/text: Permission denied"),
+    ("--tool {}/crash {}/system.db 0", "crash: it was ended by Segmentation"),
 ]
 
 
@@ -168,10 +312,14 @@ MESSAGES = [
 def test_one_line_says_why_there_is_no_preview(
     example, preview, arguments, message
 ):
-    (example.directory / "text").write_text("text " * 1000)
-    image = bytearray(example.database.read_bytes())
-    image[4096:12288] = b"\xee" * 8192
-    (example.directory / "torn").write_bytes(image)
-    words = arguments.format(example.directory).split()
+    directory = example.directory
+    (directory / "text").write_text("text " * 1000)
+    (directory / "open").mkdir()
+    (directory / "open").chmod(0o775)
+    (directory / "link").symlink_to(directory)
+    crash = other_tool(directory, "kill -SEGV $$")
+    crash.rename(directory / "crash")
+    words = arguments.replace("{}", str(directory)).split()
     last = preview(*words, status=2).splitlines()[-1]
-    assert last.startswith("tessel-preview: ") and message in last
+    assert "tessel-preview: " in last
+    assert message.replace("{}", str(directory)) in last

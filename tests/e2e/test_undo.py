@@ -23,6 +23,9 @@ START = """
     INSERT INTO note VALUES ('a'), ('b'), ('''; ATTACH ''x'' AS x; --');
     CREATE TABLE relay (id INTEGER PRIMARY KEY,
       output REFERENCES camdeviceoutput);
+    INSERT INTO relay VALUES (7, 3);
+    CREATE TABLE tag (t TEXT PRIMARY KEY);
+    INSERT INTO tag VALUES ('x'), ('y');
     CREATE VIRTUAL TABLE manual USING fts5 (page);
     INSERT INTO manual VALUES ('pan and tilt')"""
 UPGRADE = """
@@ -30,7 +33,9 @@ UPGRADE = """
     UPDATE camera SET fov = 'left side' WHERE id = 4;
     UPDATE camera SET fov = 'right side' WHERE id = 3;
     UPDATE camera SET fov = '' WHERE id = 5;
-    UPDATE note SET t = t || '!';"""
+    UPDATE note SET t = t || '!';
+    DELETE FROM relay;
+    DELETE FROM tag WHERE t = 'y'"""
 
 
 @pytest.fixture
@@ -111,6 +116,10 @@ LEFT = {
         OUTPUT_12,
         "a row of relay refers to it",
     ),
+    "DELETE FROM camdeviceoutput WHERE id = 3": (
+        "relay 7 removed: before id=7, output=3; after none; now none",
+        "it refers to a row of camdeviceoutput that is gone",
+    ),
     "UPDATE camera SET fov = 'rear side' WHERE id = 6": (
         "camera 5 (ABUS TVIP62000) changed: before fov='rear side'; ",
         FORBIDDEN,
@@ -158,6 +167,14 @@ def test_an_interrupted_upgrade_goes_back(example, upgraded):
     assert changed_rows(example.rows_before, example.rows()) == []
 
 
+def test_a_rowid_that_is_taken_keeps_no_row_away(example, upgraded):
+    file = upgraded()
+    example.sql("INSERT INTO tag VALUES ('z')")
+    undo(example, file)
+    tags = "SELECT t FROM tag ORDER BY t"
+    assert example.sql(tags) == [("x",), ("y",), ("z",)]
+
+
 def test_the_later_upgrade_goes_back_first(example, upgraded):
     first = upgraded()
     more = "UPDATE camera SET resolution = 'twice' WHERE id = 1"
@@ -170,11 +187,21 @@ def test_the_later_upgrade_goes_back_first(example, upgraded):
     assert cameras == [("QVGA",)]
 
 
+MODULES = """;
+    CREATE TABLE face_data (x);
+    PRAGMA writable_schema = ON;
+    INSERT INTO sqlite_schema VALUES ('table', 'face', 'face', 0,
+      'CREATE VIRTUAL TABLE face USING module_of_the_recorder (x)')"""
+
+
 def test_an_index_of_words_stays_whole(example, upgraded):
-    file = upgraded("UPDATE manual SET page = 'zoom'")
+    more = "UPDATE manual SET page = 'zoom'; INSERT INTO face_data VALUES (1)"
+    file = upgraded(more, START + MODULES)
     output = undo(example, file, status=3)
-    part = "not in the undo: manual_content (holds the content of a virtual "
-    assert part in output
+    for part in "manual_content", "face_data":
+        reason = "holds the content of a virtual table"
+        assert f"not in the undo: {part} ({reason})" in output
+    assert example.sql("SELECT * FROM face_data") == [(1,)]
     found = "SELECT page FROM manual WHERE manual MATCH 'zoom'"
     assert example.sql(found) == [("zoom",)]
 
