@@ -269,8 +269,8 @@ void MakeChangeFile(const std::string& strFile, const std::string& strBefore,
   Db.Execute("COMMIT");
 }
 
-void AddFile(const Database& Changes, const std::string& strName,
-             std::optional<std::string_view> Before, std::optional<std::string_view> After) {
+void AddFile(const Database& Changes, const std::string& strName, std::string_view Before,
+             std::string_view After) {
   Changes.Run("INSERT INTO file VALUES (?, ?, ?)", strName, Before, After);
 }
 

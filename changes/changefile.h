@@ -6,7 +6,7 @@
 //   before_N   the rows of table N that the upgrade changes or removes, as they are before
 //   after_N    the rows that it changes or adds, as they are afterwards
 //   dangling   the foreign keys of rows that lead nowhere before the upgrade
-//   file       a row a capability file that it changes: name, before, after (NULL: no such file)
+//   file       a row a capability file that it changes: name, before, after
 //
 // The columns of before_N and after_N are k0, k1, ... for the keys and c0, c1, ... for the columns
 // of the table, declared without a type, so that no value is converted. A changed row has the same
@@ -19,7 +19,6 @@
 #pragma once
 
 #include <cstdint>
-#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -61,10 +60,9 @@ struct ChangedTable {
 void MakeChangeFile(const std::string& strFile, const std::string& strBefore,
                     const std::string& strAfter, const Upgrade& Info);
 
-// Adds a capability file to the change file. No content means that there is no such file. Does not
-// copy the contents.
-void AddFile(const Database& Changes, const std::string& strName,
-             std::optional<std::string_view> Before, std::optional<std::string_view> After);
+// Adds a capability file to the change file. Does not copy the contents.
+void AddFile(const Database& Changes, const std::string& strName, std::string_view Before,
+             std::string_view After);
 
 // Read the change file that is open as Changes. They refuse another file, and another format.
 Upgrade ReadUpgrade(const Database& Changes);
@@ -74,8 +72,8 @@ std::vector<ChangedTable> ReadTables(const Database& Changes);
 int FindName(const std::vector<std::string>& Names, const std::string& strName);
 
 // Names a row, such as "camera 12 (VENDOR MODEL)" or "TABLE 'a', 2". The statement's row has all
-// keys from column FirstKey on and all columns of the table from FirstColumn on. A FirstColumn of -1
-// leaves the vendor and the model out.
+// keys from column FirstKey on and all columns of the table from FirstColumn on. A FirstColumn of
+// -1 leaves the vendor and the model out.
 std::string RowName(const ChangedTable& Table, const Statement& Row, int FirstKey, int FirstColumn);
 
 // --- SQL ---

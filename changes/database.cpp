@@ -87,14 +87,10 @@ void Statement::Bind(int Parameter, int64_t Number) {
   Check(sqlite3_bind_int64(m_pStatement, Parameter, Number));
 }
 
-void Statement::Bind(int Parameter, const std::optional<std::string_view>& Blob) {
+void Statement::Bind(int Parameter, std::string_view Blob) {
   sqlite3_reset(m_pStatement);
-  if (!Blob) {
-    Check(sqlite3_bind_null(m_pStatement, Parameter));
-    return;
-  }
-  const char* pBytes = Blob->empty() ? "" : Blob->data();  // a null pointer would bind NULL
-  Check(sqlite3_bind_blob64(m_pStatement, Parameter, pBytes, Blob->size(), SQLITE_STATIC));
+  const char* const pBytes = Blob.empty() ? "" : Blob.data();  // a null pointer would bind NULL
+  Check(sqlite3_bind_blob64(m_pStatement, Parameter, pBytes, Blob.size(), SQLITE_STATIC));
 }
 
 bool Statement::Step() {

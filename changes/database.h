@@ -4,7 +4,6 @@
 #include <sqlite3.h>
 
 #include <cstdint>
-#include <optional>
 #include <string>
 #include <string_view>
 
@@ -56,10 +55,10 @@ class Statement {
   Statement& operator=(const Statement&) = delete;
   sqlite3_stmt* Get() const { return m_pStatement; }
   // Each Bind first resets the statement. Text is copied. The bytes of a blob are not: they must
-  // live until the statement has run. No bytes bind NULL.
+  // live until the statement has run.
   void Bind(int Parameter, const std::string& strText);
   void Bind(int Parameter, int64_t Number);
-  void Bind(int Parameter, const std::optional<std::string_view>& Blob);
+  void Bind(int Parameter, std::string_view Blob);
   // Goes to the next row. Returns false if there is none.
   bool Step();
   // Returns a column of the row; "" for NULL.

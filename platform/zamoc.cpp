@@ -162,14 +162,14 @@ std::string SyncDir(int DirFd) {
 // copy is on stable storage before it gets the file's name, so that a power cut leaves the old
 // content or the new. Returns the reason for a failure, else an empty string.
 std::string ReplaceFile(const std::string& strFile, const std::string& strDir, int DirFd,
-                        const std::vector<Change>& Changes) {
+                        const ZAMOCTextChange& Change) {
   std::string strText;
   struct stat Stat;
   const ReadResult Result = ReadFile(strFile, &strText, &Stat);
   if (Result != ReadResult::Read) {
     return Reason(Result);
   }
-  const std::string strNewText = ChangeLines(strText, Changes);
+  const std::string strNewText = Change(strText);
   if (strNewText == strText) {
     return SyncDir(DirFd);  // who has written this may have been killed before
   }
@@ -213,6 +213,31 @@ int ZAMOCPatience::Lock(int Fd) {
   return Err;
 }
 
+std::string ZAMOCChangeText(const std::string& strFile, ZAMOCPatience* pPatience,
+                            const ZAMOCTextChange& Change, bool* pblStayedLocked) {
+  const fileops::NoCancel Guard;  // a cancelled call would lose a descriptor or leave a file
+  std::string strReal = strFile;
+  if (strReal.find('/') == std::string::npos || IsLink(strFile)) {
+    // Keep a symbolic link and replace the file that it leads to.
+    const std::unique_ptr<char, decltype(&free)> pReal(realpath(strFile.c_str(), nullptr), free);
+    if (pReal == nullptr) {
+      return Reason("realpath");
+    }
+    strReal = pReal.get();
+  }
+  const std::string strDir = strReal.substr(0, std::max<size_t>(strReal.rfind('/'), 1));
+  const fileops::Descriptor Dir(open(strDir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (Dir.Get() == -1) {
+    return Reason("open of the directory");
+  }
+  // Concurrent changes must not undo each other.
+  *pblStayedLocked = pPatience->Lock(Dir.Get()) != 0;
+  if (*pblStayedLocked) {
+    return Reason("lock of the directory");
+  }
+  return ReplaceFile(strReal, strDir, Dir.Get(), Change);
+}
+
 ZAMOCFile::ZAMOCFile(std::string strFile, ZAMOCPatience* pPatience)
     : m_strFile(std::move(strFile)), m_pPatience(pPatience) {
   const fileops::NoCancel Guard;  // a cancelled open would lose its descriptor
@@ -249,7 +274,6 @@ void ZAMOCFile::Note(const std::string& strKey, const std::string& strNewLine) {
 }
 
 int ZAMOCFile::Save() {
-  const fileops::NoCancel Guard;
   if (m_Changes.empty()) {
     return 0;
   }
@@ -258,32 +282,12 @@ int ZAMOCFile::Save() {
   } else if (!m_strUnread.empty()) {
     m_strError = m_strUnread;
   } else {
-    m_strError = ChangeFile();
+    const auto Change = [this](const std::string& strText) {
+      return ChangeLines(strText, m_Changes);
+    };
+    m_strError = ZAMOCChangeText(m_strFile, m_pPatience, Change, &m_blStayedLocked);
   }
   return m_strError.empty() ? 0 : -1;
-}
-
-std::string ZAMOCFile::ChangeFile() {
-  std::string strReal = m_strFile;
-  if (strReal.find('/') == std::string::npos || IsLink(m_strFile)) {
-    // Keep a symbolic link and replace the file that it leads to.
-    const std::unique_ptr<char, decltype(&free)> pReal(realpath(m_strFile.c_str(), nullptr), free);
-    if (pReal == nullptr) {
-      return Reason("realpath");
-    }
-    strReal = pReal.get();
-  }
-  const std::string strDir = strReal.substr(0, std::max<size_t>(strReal.rfind('/'), 1));
-  const fileops::Descriptor Dir(open(strDir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  if (Dir.Get() == -1) {
-    return Reason("open of the directory");
-  }
-  // Concurrent changes must not undo each other.
-  if (m_pPatience->Lock(Dir.Get()) != 0) {
-    m_blStayedLocked = true;
-    return Reason("lock of the directory");
-  }
-  return ReplaceFile(strReal, strDir, Dir.Get(), m_Changes);
 }
 
 void ZAMOCCopyright() { puts(ZAMOC_BANNER); }

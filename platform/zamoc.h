@@ -20,6 +20,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -36,6 +37,16 @@ class ZAMOCPatience {
  private:
   int64_t m_LeftMsec = 10000;
 };
+
+// Makes a new text of a capability file from its present one.
+using ZAMOCTextChange = std::function<std::string(const std::string& strText)>;
+
+// Replaces the text of strFile by what Change makes of it, under the lock. Leaves the file alone if
+// that is the same. Returns an empty string, or the reason for a failure; the file is then
+// unchanged, unless only the sync of the directory after the replacement failed. Sets
+// *pblStayedLocked to true if the directory stayed locked.
+std::string ZAMOCChangeText(const std::string& strFile, ZAMOCPatience* pPatience,
+                            const ZAMOCTextChange& Change, bool* pblStayedLocked);
 
 // One capability file: its keys when the object was made, and the changes to make. Must not be used
 // by two threads at a time.
@@ -76,7 +87,6 @@ class ZAMOCFile {
   bool StayedLocked() const { return m_blStayedLocked; }
 
  private:
-  std::string ChangeFile();
   void Note(const std::string& strKey, const std::string& strNewLine);
 
   const std::string m_strFile;

@@ -9,18 +9,14 @@
 #include <filesystem>
 #include <fstream>
 #include <iterator>
-#include <optional>
 
 #include "changefile.h"
 
 namespace {
 
-std::optional<std::string> ReadFile(const std::filesystem::path& File) {
+std::string ReadFile(const std::filesystem::path& File) {
   std::ifstream Stream(File, std::ios::binary);
-  if (!Stream) {
-    return {};
-  }
-  return std::string(std::istreambuf_iterator<char>(Stream), {});
+  return {std::istreambuf_iterator<char>(Stream), {}};
 }
 
 void AddFiles(const std::string& strFile, const std::filesystem::path& Before,
