@@ -97,11 +97,12 @@ std::string Diff(const std::string& strName) {
   return Result.strOutput;
 }
 
-void ReportFailures(const std::vector<FailedAction>& Failures, Report* pReport) {
+void ReportFailures(const std::vector<FailedAction>& Failures, bool blShown, Report* pReport) {
   std::set<std::string> Actions;
   for (const FailedAction& Failed : Failures) {
-    const std::string strCause = FindCause(Absolute(BEFORE_DATABASE), Failed.strSqlCmd);
-    pReport->Failed(Failed, strCause);
+    if (blShown) {
+      pReport->Failed(Failed, FindCause(Absolute(BEFORE_DATABASE), Failed.strSqlCmd));
+    }
     Actions.insert(Failed.strName);
   }
   pReport->m_Counts.Failed = static_cast<int64_t>(Actions.size());
@@ -146,7 +147,8 @@ int PreviewUpgrade(const CommandLine& Options) {
   while (Files.Step()) {
     Report.File(Files.Text(0), Diff(Files.Text(0)));
   }
-  ReportFailures(Run.Failures, &Report);
+  const bool blShown = Options.Mode == OutputMode::TEXT || Options.Mode == OutputMode::JSON;
+  ReportFailures(Run.Failures, blShown, &Report);
   Report.Summary(Run.Status);
   return Options.Mode == OutputMode::CHECK ? CheckStatus(Report, blDoubt, Run.Status) : Run.Status;
 }
