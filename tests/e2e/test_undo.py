@@ -13,7 +13,8 @@ from test_documents import options
 
 MAKE = "tests/makechanges"
 # Values that must be unique: two cameras exchange one, and a third loses one.
-# Rows that only a rowid identifies. Rows that others can refer to.
+# Rows that only a rowid identifies. Rows that others can refer to. Values that
+# differ only in case or type.
 START = """
     CREATE UNIQUE INDEX place ON camera (fov) WHERE fov LIKE '% side';
     UPDATE camera SET fov = 'left side' WHERE id = 3;
@@ -24,6 +25,8 @@ START = """
     CREATE TABLE relay (id INTEGER PRIMARY KEY,
       output REFERENCES camdeviceoutput);
     INSERT INTO relay VALUES (7, 3);
+    CREATE TABLE word (id INTEGER PRIMARY KEY, w COLLATE NOCASE, n);
+    INSERT INTO word VALUES (1, 'case', 1), (2, '', 1);
     CREATE TABLE tag (t TEXT PRIMARY KEY);
     INSERT INTO tag VALUES ('x'), ('y');
     CREATE VIRTUAL TABLE manual USING fts5 (page);
@@ -34,6 +37,8 @@ UPGRADE = """
     UPDATE camera SET fov = 'right side' WHERE id = 3;
     UPDATE camera SET fov = '' WHERE id = 5;
     UPDATE note SET t = t || '!';
+    UPDATE word SET w = 'CASE' WHERE id = 1;
+    UPDATE word SET n = 1.0 WHERE id = 2;
     DELETE FROM relay;
     DELETE FROM tag WHERE t = 'y'"""
 

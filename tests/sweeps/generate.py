@@ -68,6 +68,12 @@ TRIGGERS = """
       UPDATE OR IGNORE t{0} SET c0 = new.resolution, c1 = new.id
         WHERE (SELECT count(*) FROM t{0}) % 5 = new.id % 5;
       INSERT OR IGNORE INTO t{0} (id, c0) VALUES (new.id, new.model);
+    END;
+    CREATE TRIGGER del{0} AFTER DELETE ON t{0} BEGIN
+      UPDATE camera SET update_time = old.c0 WHERE id = old.id + 1;
+    END;
+    CREATE TRIGGER ins{0} AFTER INSERT ON t{0} BEGIN
+      UPDATE camera SET channel = new.c1 WHERE id = new.id;
     END"""
 
 
@@ -125,7 +131,8 @@ class Database:
         with suppress(sqlite3.Error):
             self.db.execute(f"CREATE {choice(INDEXES)}".format(number))
         if self.chance(0.5):
-            self.db.execute(TRIGGERS.format(number))
+            for trigger in TRIGGERS.format(number).split("END;"):
+                self.db.execute(trigger.removesuffix("END") + "END")
 
     def value(self):
         """An expression, and its parameters."""
@@ -153,6 +160,10 @@ class Database:
     def update(self, table):
         column = self.random.choice(["id", "c0", "c1", "c1"])
         value, parameters = self.value()
+        if self.chance(0.3) and not self.plain:
+            # Only types and bytes tell these from what was there.
+            same = self.random.choice(["upper({})", "trim({})", "{} + 0.0"])
+            value, parameters = same.format(column), []
         sql = f"UPDATE t{table} SET {column} = {value} WHERE chance(0.15)"
         self.run(sql, parameters)
 
