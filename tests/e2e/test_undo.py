@@ -216,12 +216,20 @@ def test_a_changed_capability_file_is_left(example, upgraded):
     example.capability_file("EX-2100", "mine\n")
     (example.caps / "EX-4310").unlink()
     (example.caps / "EX-4310").mkdir()
-    output = undo(example, file, status=3)
-    changed, unreadable = left(output)
+    changed, unreadable = left(undo(example, file, status=3))
     assert changed.startswith("left: file EX-2100: before ")
     assert changed.endswith("now 5 bytes (it has been changed since)")
     assert unreadable.startswith("left: file EX-4310: ")
     assert example.capability_files()["EX-2100"] == "mine\n"
+
+
+def test_a_file_that_cannot_be_written_is_named(example, upgraded):
+    file = upgraded()
+    (example.caps / ".zamoc.tmp").mkdir()
+    lines = left(undo(example, file, status=3))
+    reason = "(creation of a temporary file: Is a directory)"
+    assert lines and all(line.endswith(reason) for line in lines)
+    assert changed_rows(example.rows_before, example.rows()) == []
 
 
 def test_a_link_leads_to_the_database_that_sqlite_opens(
