@@ -317,7 +317,7 @@ INSERT INTO camera (id, name, vendor, model, resolution, live_resolution, mobile
   (160, 'changes', 'FOSCAM', 'R4', '1280x720', '1280x720', '2048x1536'),
   (161, 'must stay', 'FOSCAM', 'R2', '2048x1536', '2048x1536', '2048x1536');  -- another model
 
-UPDATE camera SET ip = '192.0.2.' || abs(id);
+UPDATE camera SET ip = '192.0.2.' || (abs(id) % 256);
 
 INSERT INTO camdeviceoutput (cam_id, cam_id_on_rec_server, owner_ds_id, type, idx, name)
   SELECT id, ifnull(id_on_rec_server, 0), ifnull(owner_ds_id, 0), 1, 0, 'DO 1'

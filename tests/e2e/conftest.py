@@ -23,8 +23,12 @@ KIDBGLOG = "sbin/kidbglog"
 CLIENT = "tests/unit/client"
 # The leak checker does not work in a traced program.
 STRACE = "strace -o /dev/null -E ASAN_OPTIONS=detect_leaks=0".split()
-# Time, process and line number of a log line.
-LOG_PREFIX = re.compile(r"^.{15}[.\d]* \[\d+\] ?|(?<=\.cpp):\d+")
+# A line of the log: the time, the process and perhaps the thread, the rest.
+LOG_LINE = re.compile(
+    r"(\w{3} [ \d]\d [\d:]{8}(?:\.\d{3})?) ((?:\[\d+\]){1,2}) ?(.*)"
+)
+TO_ACCEPT = "to accept: "
+ACCEPTED = pytest.StashKey[dict]()  # texts of the expected files by path
 
 # User, error, time and program of a syslog record.
 SYSLOG_PREFIX = re.compile(r"^<11>.{15} tesselupgrader: ")
@@ -33,6 +37,42 @@ SYSLOG_PREFIX = re.compile(r"^<11>.{15} tesselupgrader: ")
 def pytest_addoption(parser):
     parser.addoption("--build", default="build/dev", help="the build tree")
     parser.addoption("--accept", action="store_true", help="see scripts/test")
+
+
+def pytest_configure(config):
+    config.stash[ACCEPTED] = {}
+
+
+def pytest_terminal_summary(terminalreporter, exitstatus, config):
+    """Writes what is accepted, and says what is left to do."""
+    failed = [
+        str(report.longrepr).removeprefix("E").strip()
+        for kind in ("failed", "error")
+        for report in terminalreporter.stats.get(kind, [])
+    ]
+    to_accept = [text for text in failed if text.startswith(TO_ACCEPT)]
+    verdict = "first set right what is wrong, then accept the changes"
+    if config.getoption("accept"):
+        verdict = "accepted" if exitstatus == 0 else "wrong: nothing accepted"
+        if exitstatus == 0:
+            for path, text in config.stash[ACCEPTED].items():
+                path.write_text(text)
+    elif not to_accept:
+        return
+    elif len(to_accept) == len(failed):
+        verdict = (
+            "nothing is wrong: if the changes are intended, "
+            "scripts/test --accept writes tests/expected/"
+        )
+    terminalreporter.write_line(verdict)
+
+
+def complain(title, lines=()):
+    """Fails with a title and few enough lines for a screen."""
+    if len(lines) > 5:
+        lines = [*lines[:4], f"and {len(lines) - 4} lines more"]
+    lines = [title, *(line[:200] for line in lines)]
+    pytest.fail("\n".join(lines), pytrace=False)
 
 
 @dataclass
@@ -82,6 +122,15 @@ class Appliance:
         path.write_text(text, newline="")
         return path
 
+    def save(self):
+        """Returns database and capability files by path, for restore()."""
+        files = filter(Path.is_file, [self.database, *self.caps.glob("*")])
+        return {path: path.read_bytes() for path in files}
+
+    def restore(self, saved):
+        for path, content in saved.items():
+            path.write_bytes(content)
+
     def upgrade(self, *arguments, under=()):
         """Runs the tool, under a command such as strace if there is one."""
         rows, files = self.rows(), self.capability_files()
@@ -110,23 +159,37 @@ class Appliance:
         """Returns the log without time, process and line number."""
         if not self.log_file.exists():
             return []
-        lines = read(self.log_file).splitlines()
-        return [LOG_PREFIX.sub("", line) for line in lines]
+        lines = []
+        for line in read(self.log_file).splitlines():
+            match = LOG_LINE.fullmatch(line)
+            rest = match[3] if match else line  # a text may have many lines
+            lines.append(re.sub(r"(?<=\.cpp):\d+", "", rest))
+        return lines
 
     def rows(self):
-        """Returns all rows by table and first column, if it can."""
+        """Returns all rows by table and primary key, if it can."""
         if not self.database.exists():
             return {}
         tables = "SELECT name FROM sqlite_schema WHERE type = 'table'"
+        rows = {}
         try:
-            return {
-                (table, row[0]): dict(row)
-                for (table,) in self.sql(tables)
-                for row in self.sql(f"SELECT * FROM [{table}]", sqlite3.Row)
-                if table != "sqlite_sequence"
-            }
+            for (table,) in self.sql(tables):
+                if table != "sqlite_sequence":
+                    rows |= self.rows_of(table)
         except sqlite3.DatabaseError:
             return {}
+        return rows
+
+    def rows_of(self, table):
+        info = f"FROM pragma_table_info('{table}') WHERE pk ORDER BY pk"
+        keys = [f"[{name}]" for (name,) in self.sql(f"SELECT name {info}")]
+        keys = keys or ["rowid"]
+        text = f"SELECT {', '.join(keys)}, * FROM [{table}]"
+        rows = {}
+        for row in self.sql(text, sqlite3.Row):
+            cells = zip(row.keys()[len(keys) :], row[len(keys) :])
+            rows[table, *row[: len(keys)]] = dict(cells)
+        return rows
 
     def capability_files(self):
         """Returns the text of each file by its name."""
@@ -134,9 +197,10 @@ class Appliance:
         return {path.name: read(path) for path in files}
 
 
-def run(*command):
+def run(*command, cwd=None):
     return subprocess.run(
         command,
+        cwd=cwd,
         stdout=PIPE,
         stderr=STDOUT,
         text=True,
@@ -153,11 +217,16 @@ def show(value):
     return "NULL" if value is None else repr(value)
 
 
+def row_name(key):
+    table, *values = key
+    return f"{table} {', '.join(map(show, values))}"
+
+
 def changed_rows(before, after):
     lines = []
     for key in sorted(before.keys() | after.keys()):
         old, new = before.get(key), after.get(key)
-        name = f"{key[0]} {key[1]}"
+        name = row_name(key)
         if old is None or new is None:
             row = (old or new).items()
             cells = [f"{column}={show(value)}" for column, value in row]

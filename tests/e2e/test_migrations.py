@@ -1,21 +1,32 @@
 """What the actions do to the example, beside tests/expected/.
 
-Where a change is intended, scripts/test --accept writes those files anew.
+A message "to accept" shows how the result differs from those files. Where
+that is intended, scripts/test --accept writes them anew. Every other message
+says what is wrong, and then nothing is accepted.
 """
 
 import re
 import sqlite3
 from dataclasses import dataclass
+from pathlib import Path
 
 import pytest
-from conftest import PREVIEW, SOURCE, STRACE, new_appliance, run
+from conftest import ACCEPTED, SOURCE, STRACE, TO_ACCEPT
+from conftest import complain, new_appliance, row_name, run
 
 EXPECTED = SOURCE / "tests/expected"
+# A row of an action table: threshold and name.
 TABLE_ROW = re.compile(r"^ *\{(\d+), (?!nullptr)(\w+)\},$", re.M)
-FAST = "--trace=openat --seccomp-bpf -f".split()
+TRACE = Path("/var/trace")
+FAST = ["--trace=openat", "--seccomp-bpf", "-f", "-o", TRACE]
+# What an action logs of a text that fails: its own name, and the text.
 FAILURE = re.compile(
     r"cpp:(\w+)\(\): KiDBExecute command \((.*?)\) error\.$", re.S | re.M
 )
+# A string or a number.
+LITERAL = re.compile(r"x?'(?:[^']|'')*'|(?<![\w.])\d+(?:\.\d+)?(?![\w.])")
+# A name, perhaps in quotes, as all that is assigned or compared with.
+NAME_AS_VALUE = re.compile(r"""[=<>]\s*(['"]?)([a-z_]\w*)\1(?![\w(.])""", re.I)
 # These tests share a process, since finding all transactions takes seconds.
 with_transactions = pytest.mark.xdist_group("transactions")
 
@@ -29,53 +40,6 @@ class Transaction:
     missing: list
 
 
-def complain(title, lines=()):
-    """Fails with a title and few enough lines for a screen."""
-    if len(lines) > 5:
-        lines = [*lines[:2], f"and {len(lines) - 2} lines more"]
-    lines = [title, *(line[:200] for line in lines)]
-    pytest.fail("\n".join(lines), pytrace=False)
-
-
-def upgrade(example):
-    result = example.upgrade(0)
-    if result.status != 0:
-        shown = run(*example.command(PREVIEW, 0)).stdout.splitlines()
-        failed = [line for line in shown if line.startswith("failed: ")]
-        complain("the upgrade of the example fails", failed)
-    return result
-
-
-def failures(result):
-    """Returns action and text of each transaction that failed."""
-    return FAILURE.findall("\n".join(result.log))
-
-
-@pytest.fixture(scope="module")
-def transactions(request):
-    """All transactions of an upgrade from version 0, in order."""
-    found = []
-    with new_appliance(request.config) as example:
-        example.load_example()
-        start = example.database.read_bytes()
-        whole = upgrade(example)
-        # The tool logs a text that it cannot run, and goes on with the next
-        # action. Here, it cannot open the database for the text.
-        for number in range(1, 1000):
-            example.database.write_bytes(start)
-            inject = f"--inject=openat:error=EIO:when={number}"
-            under = [*STRACE, *FAST, "-P", example.database, inject]
-            result = example.upgrade(0, under=under)
-            failed = failures(result)
-            if not failed:
-                break
-            assert (result.status, len(failed)) == (255, 1), failed
-            done = set(result.changes)
-            missing = [line for line in whole.changes if line not in done]
-            found.append(Transaction(*failed[0], missing))
-    return found
-
-
 def tables():
     """Returns threshold and name of each row of both tables of actions."""
     source = (SOURCE / "main/tesselupgrader.cpp").read_text()
@@ -86,21 +50,115 @@ def tables():
     ]
 
 
+def failures(result):
+    """Returns action and text of each transaction that failed."""
+    return FAILURE.findall("\n".join(result.log))
+
+
+def last_action(example, start, rows, is_wrong):
+    """Returns the last action with which an upgrade from there is wrong."""
+    for threshold in sorted({row[0] for row in rows}, reverse=True):
+        example.restore(start)
+        if is_wrong(example.upgrade(threshold - 1)):
+            return " or ".join(row[1] for row in rows if row[0] == threshold)
+    return "no action alone"
+
+
+def upgrade(example):
+    """Upgrades from version 0, which has to succeed."""
+    start = example.save()
+    result = example.upgrade(0)
+    if result.status == 0:
+        return result
+    for action, text in failures(result):
+        title = f"{action} fails: {reason_of_failure(example, text)}"
+        complain(title, [text])
+    rows = sum(tables(), [])
+    output = [line for line in result.output.splitlines() if line.strip("=")]
+    names = [
+        row[1] for row in rows if re.search(rf"\b{row[1]}\b", str(output))
+    ]
+    action = " or ".join(dict.fromkeys(names)) or last_action(
+        example, start, rows, lambda again: again.status == result.status
+    )
+    reason = [line for line in output if re.search("(?i)error:", line)]
+    title = f"{action} ends the tool with status {result.status}"
+    complain(": ".join([title, *reason[:1]]), output + result.log)
+
+
+def reason_of_failure(example, text):
+    try:
+        example.sql(f"BEGIN;{text};COMMIT;")
+    except sqlite3.Error as error:
+        return error
+    return "it succeeds if it is run alone"
+
+
+def find_transactions(example):
+    """Returns all transactions of an upgrade from version 0, in order."""
+    found = []
+    start = example.save()
+    whole = upgrade(example)
+    # The tool logs a text that it cannot run, and goes on with the next
+    # action. Here, it cannot open the database for the text.
+    for number in range(1, 1000):
+        example.restore(start)
+        inject = f"--inject=openat:error=EIO:when={number}"
+        under = [*STRACE, *FAST, "-P", example.database, inject]
+        result = example.upgrade(0, under=under)
+        if "INJECTED" not in TRACE.read_text():
+            break
+        failed = failures(result)
+        if not failed:
+            last = found[-1].action if found else "the first action"
+            complain(
+                f"{last}, or the one after it, runs a text that no log line "
+                "names when it fails: use RunSql()"
+            )
+        action, text = failed[0]
+        if result.status != 255:
+            title = f"{action} hides a failure: it must return -1 when"
+            complain(f"{title} this text fails", [text])
+        if len(failed) > 1:
+            title = f"{action} goes on after this text has failed"
+            complain(title, [text])
+        done = set(result.changes)
+        missing = [line for line in whole.changes if line not in done]
+        found.append(Transaction(action, text, missing))
+    return found
+
+
+def author(transactions, line):
+    """Returns the action that makes a change."""
+    makers = [each.action for each in transactions if line in each.missing]
+    return makers[-1] if makers else "no action alone"
+
+
+@pytest.fixture(scope="module")
+def transactions(request):
+    with new_appliance(request.config) as example:
+        example.load_example()
+        return find_transactions(example)
+
+
 @pytest.fixture
 def accepts(request):
-    """Compares lines with those of an expected file, or writes the file."""
+    """Compares lines with those of an expected file, or accepts them."""
 
     def compare(name, title, lines):
         path = EXPECTED / name
         if request.config.getoption("accept"):
-            path.write_text("".join(line + "\n" for line in lines))
+            text = "".join(line + "\n" for line in lines)
+            request.config.stash[ACCEPTED][path] = text
             return
         expected = path.read_text().splitlines()
         missing = [f"- {line}" for line in expected if line not in lines]
         new = [f"+ {line}" for line in lines if line not in expected]
+        title = f"{TO_ACCEPT}{title} (tests/expected/{name})"
         if missing or new:
-            complain(f"{title} (tests/expected/{name})", missing + new)
-        assert lines == expected, f"{title}: the order in {name}"
+            complain(title, missing + new)
+        if lines != expected:
+            complain(f"{title}: only the order of lines")
 
     return compare
 
@@ -140,55 +198,167 @@ def test_each_version_selects_the_actions_above_it(appliance):
         # Each action fails, since there is no database. None makes one.
         selected = [name for name, _ in failures(appliance.upgrade(version))]
         assert not appliance.database.exists()
+        for threshold, name in rows:
+            if threshold > version and name not in selected:
+                title = f"{name} logs no text that fails: it must use RunSql()"
+                complain(f"{title}, and run from {version}")
+            if threshold <= version and name in selected:
+                complain(f"{name}, for {threshold}, runs from {version}")
         above = [name for threshold, name in rows if threshold > version]
         if selected != above:
-            title = f"an upgrade from {version} selects other actions"
-            complain(title, selected)
+            complain("the actions do not run once each, in order", selected)
 
 
 @with_transactions
-def test_every_statement_finds_a_camera_in_the_example(transactions, example):
-    idle = []
-    with sqlite3.connect(example.database) as database:
-        for transaction in transactions:
-            for statement in statements(transaction.text):
-                rows = database.execute(statement)
-                found = rows.fetchone() if rows.description else rows.rowcount
-                if not found:
-                    title = "finds no camera in the example"
-                    idle.append(f"{transaction.action} {title}: {statement}")
-    if idle:
-        complain(idle[0], idle[1:])
+def test_every_statement_says_what_it_means(transactions, example):
+    columns = {name for row in example.rows().values() for name in row}
+    wrong = []
+    for transaction in transactions:
+        texts = statements(transaction.text)
+        for text in texts:
+            for _, name in NAME_AS_VALUE.findall(text):
+                if name in columns:
+                    title = f"{transaction.action} uses the name of a column"
+                    hint = f"as a value: if it has to, write ({name})"
+                    wrong.append(f"{title} {hint}: {text}")
+        off = ["sqlite3", example.database, ".dbconfig dqs_dml off"]
+        ended = run(*off, *(f"EXPLAIN {text}" for text in texts))
+        if ended.returncode != 0:
+            reason = re.search(".*[Ee]rror.*", ended.stdout)[0]
+            title = f"{transaction.action} has a string in double quotes"
+            wrong.append(f"{title}: {reason}: {transaction.text}")
+    if wrong:
+        complain(wrong[0], wrong[1:])
 
 
-def test_an_upgrade_changes_these_cells(example, accepts):
+@with_transactions
+def test_the_example_needs_every_literal(transactions, example):
+    wrong = []
+    database = sqlite3.connect(example.database, isolation_level=None)
+    for transaction in transactions:
+        for text in statements(transaction.text):
+            found, _ = result = outcome(database, text)
+            reasons = list(idle_literals(database, text, result))
+            if not found:
+                reasons = ["finds no row of the example"]
+            wrong += [
+                f"{transaction.action}: {why}: {text}" for why in reasons
+            ]
+            database.execute(text).fetchall()
+    if wrong:
+        complain(wrong[0], wrong[1:])
+
+
+def outcome(database, text):
+    """Returns what a statement finds and leaves. Takes it back."""
+    tables = "SELECT name FROM sqlite_schema WHERE type = 'table'"
+    database.execute("SAVEPOINT before")
+    try:
+        cursor = database.execute(text)
+        return cursor.fetchall() or max(cursor.rowcount, 0), [
+            database.execute(f"SELECT * FROM [{name}]").fetchall()
+            for (name,) in database.execute(tables).fetchall()
+        ]
+    except sqlite3.Error as error:
+        return error
+    finally:
+        database.execute("ROLLBACK TO before")
+        database.execute("RELEASE before")
+
+
+def idle_literals(database, text, result):
+    """Yields the literals that others could replace."""
+    for literal in LITERAL.finditer(text):
+        others = {"'another'": f"needs {literal[0]}"}
+        if literal[0].isdigit():
+            near = [int(literal[0]) + step for step in (-1, 1)]
+            others = {f"({n})": f"tells {literal[0]} from {n}" for n in near}
+        for other, what in others.items():
+            changed = text[: literal.start()] + other + text[literal.end() :]
+            if outcome(database, changed) == result:
+                yield f"no row of the example {what}"
+
+
+def test_an_upgrade_changes_these_rows(example, accepts):
     changes = upgrade(example).changes
-    accepts("upgrade.txt", "the changed cells differ", changes)
+    expected = (EXPECTED / "upgrade.txt").read_text().splitlines()
+    # Each line without ids.
+    lost, new = (
+        [re.sub(r"(^\w+ |id=)-?\d+", r"\1", line) for line in one - other]
+        for one, other in [
+            (set(expected), set(changes)),
+            (set(changes), set(expected)),
+        ]
+    )
+    moved = [line for line in new if line in lost]
+    if moved:
+        complain("rows of the example have other ids than before", moved)
+    accepts("upgrade.txt", "the changed rows differ", changes)
 
 
-def test_a_second_upgrade_adds_outputs_and_changes_no_camera(example, accepts):
+def test_a_second_upgrade_changes_no_row_and_no_file(example, accepts):
     upgrade(example)
-    changes = upgrade(example).changes
-    again = [line for line in changes if line.startswith("camera ")]
+    start = example.save()
+    second = upgrade(example)
+    again = [line for line in second.changes if " added: " not in line]
     if again:
-        camera = " ".join(again[0].split()[:2])
-        complain(f"a second run changes {camera} again", again)
-    title = "what a second upgrade changes differs"
-    accepts("second-upgrade.txt", title, changes)
+        example.restore(start)
+        action = author(find_transactions(example), again[0])
+        complain(f"{action} changes rows again in a second upgrade", again)
+    if second.diffs:
+        files = tables()[1]
+        action = last_action(example, start, files, lambda run: run.diffs)
+        title = f"{action} changes files again in a second upgrade"
+        complain(title, second.diffs.splitlines())
+    title = "the rows that a second upgrade adds differ"
+    accepts("second-upgrade.txt", title, second.changes)
 
 
-def test_cameras_do_what_their_name_says(example):
-    cameras = example.sql("SELECT id, name, vendor, model FROM camera")
+@with_transactions
+def test_rows_do_what_they_say_and_none_is_removed(transactions, example):
+    rows = example.rows()
     changes = upgrade(example).changes
     wrong = []
-    for id, name, vendor, model in cameras:
-        own = [line for line in changes if line.startswith(f"camera {id} ")]
-        if name == "must stay":
-            wrong += own
-        elif name == "changes" and not own:
-            wrong.append(f"camera {id} ({vendor} {model}) stays")
+    for line in changes:
+        if " removed: " in line:
+            action = author(transactions, line)
+            wrong.append(f"{action} removes a row, which none may: {line}")
+    for key, row in rows.items():
+        mark = row.get("note", row.get("name"))
+        name = row_name(key)
+        own = [line for line in changes if line.startswith(f"{name} ")]
+        if own and mark == "must stay":
+            action = author(transactions, own[0])
+            wrong.append(f"{action} changes a row that must stay: {own[0]}")
+        if not own and mark == "changes":
+            wrong.append(f"no action changes {name}: {list(row.values())[:8]}")
     if wrong:
-        complain("cameras do not do what their name says", wrong)
+        complain(wrong[0], wrong[1:])
+
+
+def test_capability_files_do_what_they_say(example):
+    start, before = example.save(), example.capability_files()
+    upgrade(example)
+    changed = differing(before, example.capability_files())
+    for name, text in before.items():
+        mark = text.split("\n")[0].strip("# \r")
+        if mark == "must stay" and name in changed:
+            action = last_action(
+                example,
+                start,
+                tables()[1],
+                lambda _: name
+                in differing(before, example.capability_files()),
+            )
+            complain(f"{action} changes {name}, which must stay")
+        if mark == "changes" and name not in changed:
+            complain(f"no action changes the capability file {name}")
+        if mark not in ("must stay", "changes"):
+            complain(f"{name} begins with neither # changes nor # must stay")
+
+
+def differing(before, after):
+    return {name for name in before if before[name] != after[name]}
 
 
 @with_transactions
@@ -204,15 +374,16 @@ def test_an_action_that_fails_in_the_middle_leaves_this(transactions, accepts):
 
 
 def test_every_capability_action_changes_a_file(example, accepts):
-    example.database.unlink()
-    files = example.capability_files()
+    start = example.save()
     lines = []
     for threshold, name in tables()[1]:
         diffs = []
         for version in (threshold - 1, threshold):
-            for file, text in files.items():
-                example.capability_file(file, text)
-            diffs.append(example.upgrade(version).diffs)
+            example.restore(start)
+            result = example.upgrade(version)
+            if result.status != 0:
+                complain(f"{name}, or a later action, fails", result.log)
+            diffs.append(result.diffs)
         if diffs[0] == diffs[1]:
             complain(f"{name} changes no capability file of the example")
         lines.append(f"An upgrade from {threshold - 1}:")
