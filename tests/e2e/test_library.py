@@ -8,7 +8,10 @@ import time
 from subprocess import Popen
 
 import pytest
-from conftest import CLIENT, KIDBGLOG, STRACE, run
+from conftest import CLIENT, KIDBGLOG, LOG_LINE, STRACE, run
+
+# What the client writes: the number of the line, and some zeros.
+NUMBERED = re.compile(r"f:1:Fn\(\): (\d+) (0+)")
 
 
 def test_configuration_is_attached_from_start_to_end(appliance):
@@ -92,11 +95,11 @@ def check_lines(log, numbers):
     """Checks each line, and that it follows the last one of its thread."""
     last_time = ""
     for line in log.read_text().splitlines():
-        pattern = r"(.{19}) (\[[][\d]+\]) ?f:1:Fn\(\): (\d+) (0+)"
-        match = re.fullmatch(pattern, line)
-        assert match, f"not a whole line in {log.name}: {line}"
-        written, thread, number = match[1], match[2], int(match[3])
-        assert len(match[4]) == number % 300 + 1, f"not a whole line: {line}"
+        parts = LOG_LINE.fullmatch(line)
+        text = NUMBERED.fullmatch(parts[3]) if parts else None
+        assert text, f"not a whole line in {log.name}: {line}"
+        written, thread, number = parts[1], parts[2], int(text[1])
+        assert len(text[2]) == number % 300 + 1, f"not a whole line: {line}"
         assert written >= last_time, f"earlier than the line before: {line}"
         last = numbers.get(thread, 0)
         assert number == last + 1, f"not behind {last} in {log.name}: {line}"

@@ -34,11 +34,33 @@ inline std::vector<unsigned> Rights(const char* szPath) {
   return {Stat.st_mode, Stat.st_uid, Stat.st_gid};
 }
 
+struct LogLine {
+  std::string strTime;
+  std::string strProcess;  // in brackets
+  std::string strRest;     // without the line number in front of the function
+};
+
+// The lines of a log. A line that does not begin as it should has only a rest.
+inline std::vector<LogLine> LogLines(const char* szFile) {
+  static const std::regex Parts(R"((\w{3} [ \d]\d [\d:]{8}) ((?:\[\d+\]){1,2}) ?([^:]*:)\d+:(.*))");
+  std::vector<LogLine> Lines;
+  std::ifstream File(szFile);
+  for (std::string strLine; std::getline(File, strLine);) {
+    std::smatch Match;
+    const bool blWhole = std::regex_match(strLine, Match, Parts);
+    Lines.push_back(blWhole ? LogLine{Match[1], Match[2], Match.str(3) + Match.str(4)}
+                            : LogLine{"", "", strLine});
+  }
+  return Lines;
+}
+
 // The text of the log, without times, process ids and line numbers.
 inline std::string LogText() {
-  static const std::regex Prefix(R"(^\w{3} [ \d]\d [\d:]{8} \[\d+\] ?([^:\n]*:)\d+:)",
-                                 std::regex::ECMAScript | std::regex::multiline);
-  return std::regex_replace(ReadFile(LOG_FILE), Prefix, "$1");
+  std::string strText;
+  for (const LogLine& Line : LogLines(LOG_FILE)) {
+    strText += Line.strRest + "\n";
+  }
+  return strText;
 }
 
 // Each test starts with the empty directories of an appliance.
