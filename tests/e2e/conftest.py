@@ -97,6 +97,11 @@ class Result:
     changes: list  # a line for each changed cell, added or removed row
     diffs: str  # of the capability files
 
+    def must_be(self, status):
+        if self.status != status:
+            title = f"the tool ends with {self.status} instead of {status}"
+            complain(title, self.output.splitlines() + self.log)
+
 
 class Appliance:
     """The recorder's directories below a /var that only the test sees."""

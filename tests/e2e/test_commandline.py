@@ -4,13 +4,12 @@ import re
 import shutil
 
 import pytest
-from conftest import TOOL, run
 
+# The name and version of the tool, and how to call it.
 USAGE = (
     r"tesselupgrader [\d.]+\nUsage:\ntesselupgrader "
     r"\{pre-upgrade-version\}\|\{--updateCap remote-cap-dir\}\n"
 )
-
 
 OTHERS = ["", "1 2", "1 2 3", "--updatecap /tmp", "--updateCap / 3"]
 
@@ -18,7 +17,7 @@ OTHERS = ["", "1 2", "1 2 3", "--updatecap /tmp", "--updateCap / 3"]
 @pytest.mark.parametrize("arguments", OTHERS)
 def test_other_arguments_only_print_the_usage(example, arguments):
     result = example.upgrade(*arguments.split())
-    assert result.status == 1
+    result.must_be(1)
     assert re.fullmatch(USAGE, result.output)
     assert (result.changes, result.diffs, result.log) == ([], "", [])
 
@@ -51,8 +50,7 @@ MISSING = [
 @pytest.mark.parametrize("missing, arguments, status", MISSING)
 def test_without_the_packages_directory(example, missing, arguments, status):
     directory = example.directory / missing
-    command = example.command(TOOL, *arguments)
     shutil.rmtree(directory)
-    assert run(*command).returncode == status
+    example.upgrade(*arguments).must_be(status)
     directory.touch()
-    assert run(*command).returncode == status
+    example.upgrade(*arguments).must_be(status)
