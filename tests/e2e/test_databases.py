@@ -1,12 +1,14 @@
 """Databases that a customer's appliance may have."""
 
 import os
+import re
 import sqlite3
 from contextlib import closing
+from pathlib import Path
 from threading import Timer
 
 import pytest
-from conftest import STRACE, TOOL, run
+from conftest import STRACE, TOOL, complain, run
 from test_migrations import tables
 
 ABSENT = [
@@ -22,39 +24,50 @@ ABSENT = [
 def test_without_a_database_syslog_says_why(appliance, syslog, make, reason):
     last, name = tables()[0][-1]
     make(appliance.database)
-    assert appliance.upgrade(last - 1).status == 255
+    appliance.upgrade(last - 1).must_be(255)
     assert syslog() == [f"{name}: {appliance.database}: {reason}"]
 
 
-DAMAGE = [
-    lambda image: b"",
-    lambda image: b"text" * 1000,
-    lambda image: image[:4096] + b"\xff" * 4096,
-]
-
-
-@pytest.mark.parametrize("damage", DAMAGE)
-def test_a_file_that_is_no_database_is_an_error_and_stays(example, damage):
-    image = damage(example.database.read_bytes())
+def test_a_file_that_is_no_database_is_an_error_and_stays(example):
+    image = b"text" * 1000
     example.database.write_bytes(image)
-    assert example.upgrade(0).status == 255
+    example.upgrade(0).must_be(255)
     assert example.database.read_bytes() == image
 
 
-@pytest.mark.parametrize("seconds, status", [(3, 0), (300, 255)])
-def test_an_action_waits_some_seconds_for_the_recorder(
-    example, seconds, status
-):
-    last = max(threshold for threshold, _ in tables()[0])
+@pytest.fixture
+def recorder(example):
+    """A connection of the recorder that has locked the database."""
     recorder = sqlite3.connect(example.database, check_same_thread=False)
     with closing(recorder):
         recorder.execute("BEGIN EXCLUSIVE")
-        timer = Timer(seconds, recorder.rollback)
-        timer.start()
-        ended = run(*example.command(TOOL, last - 1))
-        timer.cancel()
-        timer.join()
-    assert ended.returncode == status
+        yield recorder
+
+
+LAST = str(max(threshold for threshold, _ in tables()[0]) - 1)
+
+
+def test_an_action_waits_for_the_recorder(example, recorder):
+    timer = Timer(1, recorder.rollback)
+    timer.start()
+    ended = run(*example.command(TOOL, LAST))
+    timer.join()
+    assert ended.returncode == 0, ended.stdout
+
+
+def test_an_action_waits_for_five_seconds(example, recorder, syslog):
+    trace = Path("/var/trace")
+    no_time_passes = ["--trace=/nanosleep", "--inject=/nanosleep:retval=0"]
+    under = [*STRACE, "-o", trace, *no_time_passes]
+    ended = run(*under, *example.command(TOOL, LAST))
+    assert ended.returncode == 255, ended.stdout
+    name = tables()[0][-1][1]
+    assert syslog() == [f"{name}: database is locked (extended code 5)"]
+    # How long each call would have waited.
+    sleeps = re.findall(r"tv_sec=(\d+), tv_nsec=(\d+)", trace.read_text())
+    seconds = sum(int(s) + int(nanos) / 1e9 for s, nanos in sleeps)
+    if round(seconds, 3) != 5:
+        complain(f"an action waits {seconds} seconds for the database, not 5")
 
 
 @pytest.mark.parametrize("escape", ["ATTACH {} AS o", "VACUUM INTO {}"])
@@ -66,20 +79,21 @@ def test_a_value_reaches_no_other_file(example, syslog, escape):
     value = f"..'; COMMIT; {escape}; BEGIN; --".replace("'", "''")
     wired = f"SET connected_wire = '{value}' WHERE model = 'A8105-E'"
     example.sql(f"UPDATE camera {wired}")
-    assert example.upgrade(2400).status == 255
+    example.upgrade(2400).must_be(255)
     assert outside.read_bytes() == b""
     reason = "too many attached databases - max 0 (extended code 1)"
     assert syslog() == [f"UpdateAxisA8105E: {reason}"]
 
 
 def test_a_failed_action_has_one_record_of_one_line(example, syslog):
-    assert (example.upgrade(0).status, syslog()) == (0, [])
+    example.upgrade(0).must_be(0)
+    assert syslog() == []
     example.sql(
         "CREATE TRIGGER guard BEFORE UPDATE ON camera BEGIN "
         "SELECT raise(ABORT, 'guard says\n<3>no'); END;"
         "INSERT INTO camera (vendor, model) VALUES ('ASUS', 'AiCam NightView')"
     )
-    assert example.upgrade(2472).status == 255
+    example.upgrade(2472).must_be(255)
     reason = "guard says?<3>no (extended code 1811)"
     assert syslog() == [f"RenameASUSAiCamNightViewModel: {reason}"]
 
@@ -92,5 +106,5 @@ def test_many_cameras_need_no_temporary_file(example, tmp_path):
     )
     trace = tmp_path / "trace"
     under = [*STRACE, "-o", trace, "-e", "openat"]
-    assert example.upgrade(563, under=under).status == 0
+    example.upgrade(563, under=under).must_be(0)
     assert trace.read_text().count("/etilqs_") == 0

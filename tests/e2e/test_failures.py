@@ -3,14 +3,13 @@
 import json
 import os
 import re
-import sqlite3
 import subprocess
 import time
-from contextlib import closing
 
 import pytest
 from conftest import PREVIEW, STRACE, TOOL, UNDO
 from conftest import changed_rows, run
+from test_migrations import tables
 
 GUARD = """
     CREATE TRIGGER guard BEFORE UPDATE ON camera WHEN old.id = 31
@@ -122,19 +121,9 @@ def test_among_many_cameras_the_one_is_found_soon(example, preview):
     assert seconds[1] < 3 * seconds[0]
 
 
-LAST = "UpdateReolinkRLC411And423Series"
-MOVE = "UpgradeOnvifConfForPtzContinuousMove"
-SPEED = "UpgradeOnvifConfForContinuousPtzSpeed"
+THRESHOLD, LAST = tables()[0][-1]
+MOVE, SPEED = [name for _, name in tables()[1]][:2]
 READ_ONLY = "creation of a temporary file: Read-only file system"
-
-
-@pytest.fixture
-def held(example):
-    """The recorder keeps the database locked."""
-    recorder = sqlite3.connect(example.database, isolation_level=None)
-    with closing(recorder):
-        recorder.execute("BEGIN EXCLUSIVE")
-        yield
 
 
 @pytest.fixture
@@ -150,15 +139,9 @@ def read_only(appliance):
     subprocess.check_call(["umount", appliance.caps])
 
 
-def test_a_locked_database_has_one_record(example, held, syslog):
-    command = example.command(TOOL, 2474)
-    assert run(*command).returncode == 255
-    assert syslog() == [f"{LAST}: database is locked (extended code 5)"]
-
-
 def test_a_full_disk_has_one_record(example, syslog):
     full = ["-P", example.database, "-e", "inject=pwrite64:error=ENOSPC"]
-    result = example.upgrade(2474, under=[*STRACE, *full])
+    result = example.upgrade(THRESHOLD - 1, under=[*STRACE, *full])
     assert (result.status, result.changes) == (255, [])
     assert syslog() == [f"{LAST}: database or disk is full (extended code 13)"]
 
@@ -167,7 +150,7 @@ def test_a_read_only_directory_has_one_record_an_action(
     appliance, read_only, syslog
 ):
     assert appliance.upgrade("--updateCap", appliance.caps).status == 255
-    assert syslog() == [
+    assert syslog()[:2] == [
         f"{MOVE}: camera: {READ_ONLY}",
         f"{SPEED}: camera: {READ_ONLY}",
     ]
