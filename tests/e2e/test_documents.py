@@ -1,4 +1,4 @@
-"""What scripts and programs say of themselves, and documents of them."""
+"""What documents say of programs, scripts and files."""
 
 import re
 import subprocess
@@ -9,40 +9,6 @@ from test_migrations import tables
 
 TRACKED = subprocess.check_output(["git", "ls-files"], cwd=SOURCE, text=True)
 DOCUMENTS = re.findall(r".*\.md$", TRACKED, re.M)
-SCRIPTS = re.findall(r"^scripts/(?!usage).*|^\.ci/run$", TRACKED, re.M)
-RUNNERS = ["tools/private-appliance", "tools/private-var", "tools/run-armhf"]
-
-
-@pytest.fixture
-def call(tmp_path):
-    """Runs a script that finds no program to begin its work with."""
-    for name in "bash dirname env realpath sed".split():
-        (tmp_path / name).symlink_to(f"/usr/bin/{name}")
-
-    def run_script(script, argument):
-        """Returns status, output and errors."""
-        ended = subprocess.run(
-            [SOURCE / script, argument],
-            env={"PATH": str(tmp_path)},
-            capture_output=True,
-            text=True,
-        )
-        return ended.returncode, ended.stdout, ended.stderr
-
-    return run_script
-
-
-@pytest.mark.parametrize("script", SCRIPTS + RUNNERS)
-def test_script_prints_its_header_and_refuses_other_options(call, script):
-    status, output, errors = call(script, "--help")
-    assert (status, errors) == (0, "")
-    assert script.rpartition("/")[2] in output.splitlines()[0]
-    assert "set -" not in output
-    status, output, errors = call(script, "--nonsense")
-    # The status 2 may be that of a runner's command.
-    assert (status, output) == (125 if script in RUNNERS else 2, "")
-    assert "nonsense" in errors or "usage" in errors
-
 
 STATUSES = [
     # program, arguments that lead to each status of its man page
@@ -61,10 +27,12 @@ STATUSES = [
 
 
 def statuses(page):
+    """Returns those that begin a paragraph of a man page, or a table row."""
     return set(map(int, re.findall(r"^(?:\.B|\|) (\d+)", page, re.M)))
 
 
 def options(text):
+    """Returns the long options that a text names."""
     others = {"--help", "--version", "--follow", "--no"}  # two are of patch
     return set(re.findall("--[a-z]+", text)) - others
 
@@ -94,6 +62,7 @@ def test_man_page_is_right(appliance, tmp_path, program, commands):
 @pytest.mark.parametrize("document", DOCUMENTS)
 def test_links_and_named_files_exist(document):
     text = (SOURCE / document).read_text()
+    # The target of each link, without #section. Those of other sites differ.
     links = re.findall(r"[^[]\]\(([^):#]+)[^):]*\)", text)
     rooms = "scripts|tools|examples|docs|tests|packaging"
     named = re.findall(rf"(?<![\w./-])(?:{rooms})/[\w./-]*\w", text)
