@@ -72,11 +72,13 @@ def test_shows_what_the_upgrade_then_changes(example, preview):
     assert sorted(shown) == sorted(upgrade.changes)
     cells = [line for line in upgrade.changes if " -> " in line]
     added = len(upgrade.changes) - len(cells)
-    cameras = {line.split()[1] for line in cells}
+    others = [line for line in cells if not line.startswith("camera ")]
+    count = len(cells) - len(others)
+    cameras = {line.split()[1] for line in cells if line not in others}
     files = upgrade.diffs.count("--- ")
     assert text.endswith(
-        f"\n{upgrade.diffs}{len(cells)} cells in {len(cameras)} cameras, "
-        f"0 other cells, {added} rows added, 0 rows removed, "
+        f"\n{upgrade.diffs}{count} cells in {len(cameras)} cameras, "
+        f"{len(others)} other cells, {added} rows added, 0 rows removed, "
         f"{files} files changed, 0 actions failed\n"
     )
 
