@@ -18,12 +18,11 @@ MOVE, SPEED = ACTIONS[:2]
 def test_only_the_removal_of_the_marker_has_to_work(
     appliance, syslog, marker, status
 ):
-    (appliance.caps / ".zamoc.tmp").mkdir()
     file = appliance.capability_file("camera", "pan=yes\n" + marker)
-    appliance.upgrade("--updateCap", CAPS).must_be(status)
-    assert file.read_text() == "pan=yes\n" + marker
-    step = "creation of a temporary file"
-    assert syslog()[0] == f"{MOVE}: camera: {step}: Is a directory"
+    under = [*STRACE, "-e", "inject=/rename:error=EIO:when=1"]
+    appliance.upgrade("--updateCap", CAPS, under=under).must_be(status)
+    assert "pan=yes\n" + marker in file.read_text()
+    assert syslog()[0] == f"{MOVE}: camera: rename: Input/output error"
 
 
 def test_without_a_directory_syslog_says_so(syslog, appliance):
