@@ -29,7 +29,7 @@ LOG_LINE = re.compile(
 )
 TO_ACCEPT = "to accept: "
 ACCEPTED = pytest.StashKey[dict]()  # texts of the expected files by path
-told = set()  # what failed tests have said
+complaints = set()  # of all tests so far
 
 # User, error, time and program of a syslog record.
 SYSLOG_PREFIX = re.compile(r"^<11>.{15} tesselupgrader: ")
@@ -45,20 +45,21 @@ def pytest_configure(config):
 
 
 @pytest.hookimpl(hookwrapper=True)
-def pytest_runtest_makereport():
-    """Lets only one of the tests fail that fail for the same reason."""
+def pytest_runtest_makereport(call):
+    """Lets only one of the tests fail that complain of the same."""
     report = (yield).get_result()
-    reason = str(report.longrepr)
-    if report.failed and reason in told:
-        report.outcome = "skipped"
-        report.longrepr = (__file__, 0, "fails as another test does")
-    told.add(reason)
+    if report.failed and call.excinfo.errisinstance(pytest.fail.Exception):
+        complaint = str(call.excinfo.value)
+        if complaint in complaints:
+            report.outcome = "skipped"
+            report.longrepr = (__file__, 0, "fails as another test does")
+        complaints.add(complaint)
 
 
 def pytest_terminal_summary(terminalreporter, exitstatus, config):
     """Writes what is accepted, and says what is left to do."""
     failed = [
-        str(report.longrepr).removeprefix("E").strip()
+        str(report.longrepr)
         for kind in ("failed", "error")
         for report in terminalreporter.stats.get(kind, [])
     ]

@@ -5,7 +5,6 @@ import re
 import sqlite3
 from contextlib import closing
 from pathlib import Path
-from threading import Timer
 
 import pytest
 from conftest import STRACE, TOOL, complain, run
@@ -35,38 +34,21 @@ def test_a_file_that_is_no_database_is_an_error_and_stays(example):
     assert example.database.read_bytes() == image
 
 
-@pytest.fixture
-def recorder(example):
-    """A connection of the recorder that has locked the database."""
-    recorder = sqlite3.connect(example.database, check_same_thread=False)
-    with closing(recorder):
-        recorder.execute("BEGIN EXCLUSIVE")
-        yield recorder
-
-
-LAST = max(threshold for threshold, _ in tables()[0])
-
-
-def test_an_action_waits_for_the_recorder(example, recorder):
-    timer = Timer(1, recorder.rollback)
-    timer.start()
-    ended = run(*example.command(TOOL, LAST - 1))
-    timer.join()
-    assert ended.returncode == 0, ended.stdout
-
-
-def test_an_action_waits_for_five_seconds(example, recorder, syslog):
+def test_an_action_waits_five_seconds_for_the_recorder(example, syslog):
+    thresholds = [threshold for threshold, _ in tables()[0]]
     trace = Path("/var/trace")
     no_time_passes = ["--trace=/nanosleep", "--inject=/nanosleep:retval=0"]
     under = [*STRACE, "-o", trace, *no_time_passes]
-    ended = run(*under, *example.command(TOOL, LAST - 1))
+    with closing(sqlite3.connect(example.database)) as recorder:
+        recorder.execute("BEGIN EXCLUSIVE")
+        ended = run(*under, *example.command(TOOL, max(thresholds) - 1))
     assert ended.returncode == 255, ended.stdout
     name = tables()[0][-1][1]
-    assert syslog() == [f"{name}: database is locked (extended code 5)"]
+    assert syslog()[-1] == f"{name}: database is locked (extended code 5)"
     # How long each call would have waited.
     sleeps = re.findall(r"tv_sec=(\d+), tv_nsec=(\d+)", trace.read_text())
     seconds = sum(int(s) + int(nanos) / 1e9 for s, nanos in sleeps)
-    seconds /= sum(threshold == LAST for threshold, _ in tables()[0])
+    seconds /= thresholds.count(max(thresholds))
     if round(seconds, 3) != 5:
         complain(f"an action waits {seconds} seconds for the database, not 5")
 
