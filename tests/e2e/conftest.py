@@ -263,6 +263,7 @@ def changed_rows(before, after):
 def unified_diffs(before, after):
     text = ""
     for name in sorted(before.keys() | after.keys()):
+        # Lines, of which the last one may lack its end.
         old, new = (
             re.findall(r".*\n|.+$", files.get(name, ""))
             for files in (before, after)

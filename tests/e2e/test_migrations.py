@@ -74,11 +74,12 @@ def upgrade(example):
     if result.status == 0:
         return result
     for action, text in failures(result):
+        reason = "but its text alone does not"
         try:
             example.sql(f"BEGIN;{text};COMMIT;")
         except sqlite3.Error as error:
-            complain(f"{action} fails: {error}", [text])
-        complain(f"{action} fails, but its text alone does not", [text])
+            reason = error
+        complain(f"{action} fails: {reason}", [text])
     rows = sum(tables(), [])
     output = re.sub(r"==\d+==|0x\w+ ", "", result.output).splitlines()
     own = [line for line in output if "main/tesselupgrader.cpp" in line]
