@@ -251,9 +251,9 @@ TEST_F(Log, ConfigurationOfAnotherUserIsNotUsed) {
 TEST_F(Log, ConfigurationKeepsItsLayoutAndItsBounds) {
   // Other programs find these words here: the time scale, the levels of 512 categories, the number
   // of processes, and two words for each process.
-  constexpr size_t LAST_LEVEL = 512;
-  constexpr size_t PID_COUNT = LAST_LEVEL + 1;
-  constexpr size_t FIRST_PID = PID_COUNT + 1;
+  constexpr size_t LastLevel = 512;
+  constexpr size_t PidCount = LastLevel + 1;
+  constexpr size_t FirstPid = PidCount + 1;
   auto* const pWords = reinterpret_cast<int32_t*>(&m_Cfg);
   for (int Value = 101; Value <= 165; ++Value) {  // one too many
     m_Cfg.SetPidLevel(Value, LOG_LEVEL_DEBUG);
@@ -267,12 +267,12 @@ TEST_F(Log, ConfigurationKeepsItsLayoutAndItsBounds) {
     m_Cfg.SetLogLevel(Categ(Value), Level(256 + Value));
   }
   EXPECT_EQ(Numbers(pWords, pWords + 2), (Numbers{0, 256}));
-  EXPECT_EQ(pWords[LAST_LEVEL], 767);
-  EXPECT_EQ(Numbers(pWords + PID_COUNT, pWords + FIRST_PID + 4), (Numbers{2, 102, 5, 164, 1}));
-  pWords[PID_COUNT] = INT32_MAX;  // another program may store any count
+  EXPECT_EQ(pWords[LastLevel], 767);
+  EXPECT_EQ(Numbers(pWords + PidCount, pWords + FirstPid + 4), (Numbers{2, 102, 5, 164, 1}));
+  pWords[PidCount] = INT32_MAX;  // another program may store any count
   EXPECT_EQ(m_Cfg.GetPidLevel(166), LOG_LEVEL_ALARM);
   m_Cfg.Init(0);
-  EXPECT_EQ(Numbers(pWords + PID_COUNT, pWords + FIRST_PID + 2), (Numbers{0, 0, 0}));
+  EXPECT_EQ(Numbers(pWords + PidCount, pWords + FirstPid + 2), (Numbers{0, 0, 0}));
 }
 
 std::string Base64(const char* szText) {
