@@ -4,6 +4,8 @@ set(CMAKE_SYSTEM_NAME Linux)
 set(CMAKE_SYSTEM_PROCESSOR armv7l)
 set(CMAKE_LIBRARY_ARCHITECTURE arm-linux-gnueabihf)
 set(CMAKE_CXX_COMPILER arm-linux-gnueabihf-g++)
+# GCC 7 changed how some parameters are passed. No code here was compiled before.
+set(CMAKE_CXX_FLAGS_INIT -Wno-psabi)
 
 cmake_path(GET CMAKE_CURRENT_LIST_DIR PARENT_PATH TESSEL_ROOT)
 set(CMAKE_FIND_ROOT_PATH ${TESSEL_ROOT}/build/armhf-sysroot)

@@ -29,11 +29,6 @@ struct FileCloser {
 };
 using File = std::unique_ptr<FILE, FileCloser>;
 
-File Open(const char* szFile) {
-  const fileops::NoCancel Guard;
-  return File(fopen(szFile, "re"));
-}
-
 struct LineBuffer {
   ~LineBuffer() { free(szLine); }
   char* szLine = nullptr;
@@ -65,7 +60,7 @@ struct ReadResult {
 // only its keys count.
 ReadResult ReadKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals) {
   char rgBuf[4096];  // must outlive the stream; saves it asking the system for a size
-  const File pFile = Open(szFile);
+  const File pFile(fopen(szFile, "re"));
   if (pFile == nullptr) {
     return {-1, errno};
   }
@@ -111,6 +106,9 @@ int LockAfterSignals(KiFlock& Lock, bool blExclusive) {
 
 // Adds the pairs of szFile to KeyVals under a shared lock. Returns the number of lines, or -1.
 int GetKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals) {
+  // On ARM, a cancelled read is not unwound through the streams of the C library: the lock and the
+  // stream would stay open.
+  const fileops::NoCancel Guard;
   KiFlock Lock(szFile);
   if (LockAfterSignals(Lock, false) != 0) {
     KIDBGLOG(LOG_CATEG_UTILS, LOG_LEVEL_ERROR, "Failed to lock file [%s] with errno [%d]\n", szFile,
@@ -123,6 +121,13 @@ int GetKeyVals(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals) {
              Result.Errno);
   }
   return Result.Match;
+}
+
+// A thread that does nothing but read can be cancelled all the same: here, with nothing open.
+int GetAndTestCancel(const char* szFile, const KeySet* pKeys, KeyValMap& KeyVals) {
+  const int Match = GetKeyVals(szFile, pKeys, KeyVals);
+  pthread_testcancel();
+  return Match;
 }
 
 // Cancelling a thread in the middle of a change would leave a temporary file and a lock. Always
@@ -252,20 +257,20 @@ int UpdateKeyVals(const char* szFile, const KeyValMap& AddKeyVals, const KeySet&
 
 int KiFileGetAllKeyVals(const char* szFile, std::map<std::string, std::string>& KeyVals) {
   KeyVals.clear();
-  return GetKeyVals(szFile, nullptr, KeyVals);
+  return GetAndTestCancel(szFile, nullptr, KeyVals);
 }
 
 int KiFileGetKeyVals(const char* szFile, const std::set<std::string>& Keys,
                      std::map<std::string, std::string>& KeyVals) {
   KeyVals.clear();
-  return GetKeyVals(szFile, &Keys, KeyVals);
+  return GetAndTestCancel(szFile, &Keys, KeyVals);
 }
 
 int KiFileGetVal(const char* szFile, const char* szKey, std::string& strVal) {
   const std::string strKey = szKey;
   const KeySet Keys = {strKey};
   KeyValMap KeyVals;
-  const int Ret = GetKeyVals(szFile, &Keys, KeyVals);
+  const int Ret = GetAndTestCancel(szFile, &Keys, KeyVals);
   strVal = KeyVals[strKey];
   return Ret;
 }
