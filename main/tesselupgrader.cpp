@@ -510,11 +510,12 @@ static int ForEachCapFile(int (*pUpgradeFile)(ZAMOCFile& File),
     const std::string strName = pEntry->d_name;
     ZAMOCFile File(szCapPath + ("/" + strName), &Patience);
     const int Err = pUpgradeFile(File);
+    const bool blEnds = Err != 0 || File.StayedLocked();
     if (!File.Error().empty()) {
-      const char* szEnd = File.StayedLocked() ? "; later files are left alone" : "";
+      const char* szEnd = blEnds ? "; later files are left alone" : "";
       ReportFailure(szAction, strName + ": " + File.Error() + szEnd);
     }
-    if (Err != 0 || File.StayedLocked()) {
+    if (blEnds) {
       return Err == 0 ? 0 : -1;
     }
   }

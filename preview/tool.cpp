@@ -88,8 +88,10 @@ bool IsOfTheCopy(const FailedAction& Failed) {
     const int Code = Failed.Code & 0xff;
     return Code == SQLITE_NOMEM || Code == SQLITE_IOERR || Code == SQLITE_FULL;
   }
-  const size_t Colon = Failed.strReason.rfind(": ");
-  const std::string strSystem = Failed.strReason.substr(Colon == std::string::npos ? 0 : Colon + 2);
+  // "FILE: STEP: REASON", perhaps with what follows from it after a semicolon.
+  const std::string strCause = Failed.strReason.substr(0, Failed.strReason.find("; "));
+  const size_t Colon = strCause.rfind(": ");
+  const std::string strSystem = strCause.substr(Colon == std::string::npos ? 0 : Colon + 2);
   const std::initializer_list<int> Errors = {ENOMEM, EIO, ENOSPC, EDQUOT, EMFILE, ENFILE};
   return std::any_of(Errors.begin(), Errors.end(),
                      [&strSystem](int Errno) { return strSystem == strerror(Errno); });

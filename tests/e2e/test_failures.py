@@ -151,6 +151,6 @@ def test_a_read_only_directory_has_one_record_an_action(
 ):
     assert appliance.upgrade("--updateCap", appliance.caps).status == 255
     assert syslog()[:2] == [
-        f"{MOVE}: camera: {READ_ONLY}",
+        f"{MOVE}: camera: {READ_ONLY}; later files are left alone",
         f"{SPEED}: camera: {READ_ONLY}",
     ]
