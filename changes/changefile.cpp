@@ -21,121 +21,112 @@ constexpr const char* SETTINGS =
 
 constexpr const char* TABLES =
     "CREATE TABLE upgrade (version, tool, tool_version, time, database, inode, schema_version);"
-    "CREATE TABLE covered (number INTEGER PRIMARY KEY, name, keys, collations, columns, rowid_name,"
-    "  rowid_only, definition, reason, doubt);"
+    "CREATE TABLE covered (number INTEGER PRIMARY KEY, name, definition, without_rowid, keys,"
+    "  collations, columns, rowid_name, rowid_only, key_index, reason, doubt);"
     "CREATE TABLE dangling (child, row, parent, id, count);"
     "CREATE TABLE file (name PRIMARY KEY, before, after);"
     "PRAGMA application_id = ";
 
-// If only the recorder has the module of a virtual table (ncol is 0), the tables that hold its
-// content are known by their names alone.
-constexpr const char* OBJECTS = R"(
+// Lists all tables and views. Those that can be compared have no reason yet. If only the recorder
+// has the module of a virtual table (ncol is 0), the tables that hold its content are known by
+// their names alone.
+constexpr const char* LIST_TABLES = R"(
   WITH definition AS (
     SELECT 'before' AS side, name, sql FROM before.sqlite_schema WHERE type IN ('table', 'view')
     UNION ALL
-    SELECT 'after', name, sql FROM after.sqlite_schema WHERE type IN ('table', 'view'))
-  SELECT name, max(wr), max(sql), CASE
-      WHEN count(*) = 1 THEN 'exists only ' || side || ' the upgrade'
-      WHEN min(sql) IS NOT max(sql) THEN 'the upgrade changes its definition'
-    END, CASE
-      WHEN type = 'view' THEN type
-      WHEN type = 'virtual' THEN 'virtual table'
-      WHEN name = 'sqlite_sequence' THEN 'an id is never given out twice'
-      WHEN name LIKE 'sqlite\_%' ESCAPE '\' THEN 'belongs to SQLite'
-    END, type = 'shadow' OR EXISTS (
-      SELECT 1 FROM pragma_table_list AS v WHERE v.type = 'virtual' AND v.ncol = 0
-      AND substr(l.name, 1, length(v.name) + 1) = v.name || '_' COLLATE NOCASE)
-  FROM definition JOIN pragma_table_list AS l USING (name) WHERE l.schema = side
-  GROUP BY name ORDER BY name)";
+    SELECT 'after', name, sql FROM after.sqlite_schema WHERE type IN ('table', 'view')),
+  listed AS (
+    SELECT name, max(wr) AS wr, max(sql) AS sql, CASE
+        WHEN count(*) = 1 THEN 'exists only ' || side || ' the upgrade'
+        WHEN min(sql) IS NOT max(sql) THEN 'the upgrade changes its definition'
+      END AS change, CASE
+        WHEN type = 'view' THEN type
+        WHEN type = 'virtual' THEN 'virtual table'
+        WHEN name = 'sqlite_sequence' THEN 'an id is never given out twice'
+        WHEN name LIKE 'sqlite\_%' ESCAPE '\' THEN 'belongs to SQLite'
+      END AS kind, type = 'shadow' OR EXISTS (
+        SELECT 1 FROM pragma_table_list AS v WHERE v.type = 'virtual' AND v.ncol = 0
+        AND substr(l.name, 1, length(v.name) + 1) = v.name || '_' COLLATE NOCASE) AS shadow
+    FROM definition JOIN pragma_table_list AS l USING (name) WHERE l.schema = side
+    GROUP BY name)
+  INSERT INTO covered (name, definition, reason, doubt, without_rowid)
+  SELECT name, sql,
+    coalesce(change, kind, iif(shadow, 'holds the content of a virtual table', '')),
+    iif(coalesce(change, kind) IS NULL, NULL, change IS NOT NULL), wr
+  FROM listed ORDER BY name)";
+
+// Finds what identifies a row: the primary key, by its index if there is one, or the rowid.
+constexpr const char* LIST_COLUMNS = R"(
+  UPDATE covered AS t SET
+    columns = (SELECT json_group_array(name) FROM pragma_table_xinfo(t.name, 'before')
+               WHERE NOT hidden),
+    key_index = (SELECT name FROM pragma_index_list(t.name, 'before') WHERE origin = 'pk'),
+    rowid_name = (SELECT column1 FROM (VALUES ('rowid'), ('_rowid_'), ('oid'))
+                  WHERE NOT without_rowid AND column1 NOT IN (
+                    SELECT lower(name) FROM pragma_table_xinfo(t.name, 'before')) LIMIT 1)
+  WHERE doubt IS NULL;
+  UPDATE covered AS t SET (keys, collations, key_index) = (
+    SELECT json_group_array(name), json_group_array(coll), iif(t.without_rowid, NULL, t.key_index)
+    FROM pragma_index_xinfo(t.key_index, 'before') WHERE key)
+  WHERE key_index IS NOT NULL;
+  UPDATE covered AS t SET keys = json_array(c.name), collations = '["BINARY"]', rowid_name = c.name
+  FROM (SELECT t.name AS of, c.name FROM covered AS t JOIN pragma_table_info(t.name, 'before') AS c
+        WHERE t.doubt IS NULL AND t.keys IS NULL AND c.pk) AS c
+  WHERE t.name = c.of)";
+
+constexpr const char* USE_ROWID = R"(
+  UPDATE covered SET keys = json_array(rowid_name), collations = '["BINARY"]', rowid_only = 1,
+    key_index = NULL
+  WHERE keys IS NULL AND doubt IS NULL OR number = )";
 
 constexpr const char* DANGLING = R"(
   INSERT INTO {list} SELECT "table", rowid, parent, fkid, count(*)
   FROM pragma_foreign_key_check(?, '{schema}') GROUP BY 1, 2, 3, 4)";
 
-struct Object {
-  ChangedTable Table;
-  bool blWithoutRowid;
-  bool blShadow;  // holds the content of a virtual table
-};
-
-// --- What identifies a row ---
-
-std::vector<std::string> Strings(Statement&& Query, const std::string& strParameter) {
-  Query.Bind(1, strParameter);
-  std::vector<std::string> Result;
-  while (Query.Step()) {
-    Result.push_back(Query.Text(0));
-  }
-  return Result;
-}
-
-void ReadColumns(const Database& Db, ChangedTable* pTable) {
-  std::vector<std::string> All;
-  Statement Info(Db, "SELECT name, hidden FROM pragma_table_xinfo(?, 'before')");
-  Info.Bind(1, pTable->strName);
-  while (Info.Step()) {
-    All.push_back(Info.Text(0));
-    if (Info.Int(1) == 0) {
-      pTable->Columns.push_back(Info.Text(0));
+// Returns the tables that the condition selects.
+std::vector<ChangedTable> ReadCovered(const Database& Changes, const std::string& strWhere) {
+  const auto List = [&](const char* szArray, int64_t Number) {
+    Statement Elements(Changes, "SELECT e.value FROM covered, json_each(" + std::string(szArray) +
+                                    ") AS e WHERE number = ?");
+    Elements.Bind(1, Number);
+    std::vector<std::string> Result;
+    while (Elements.Step()) {
+      Result.push_back(Elements.Text(0));
     }
-  }
-  if (All.size() > MAX_COLUMNS) {
-    throw SqlFailure(SQLITE_ERROR, "more than " + std::to_string(MAX_COLUMNS) + " columns");
-  }
-  for (const char* szName : {"oid", "_rowid_", "rowid"}) {
-    if (FindName(All, szName) == -1) {
-      pTable->strRowid = szName;
+    return Result;
+  };
+  Statement Read(Changes,
+                 "SELECT number, name, rowid_name, rowid_only, key_index, definition, reason, doubt"
+                 " FROM covered WHERE " +
+                     strWhere + " ORDER BY number");
+  std::vector<ChangedTable> Tables;
+  while (Read.Step()) {
+    ChangedTable Table;
+    Table.Number = Read.Int(0);
+    Table.strName = Read.Text(1);
+    Table.Keys = List("keys", Table.Number);
+    Table.Collations = List("collations", Table.Number);
+    Table.Columns = List("columns", Table.Number);
+    Table.strRowid = Read.Text(2);
+    Table.blRowidOnly = Read.Int(3) != 0;
+    Table.strKeyIndex = Read.Text(4);
+    Table.strDefinition = Read.Text(5);
+    Table.strReason = Read.Text(6);
+    Table.blDoubt = Read.Int(7) != 0;
+    if (FindName({"camera"}, Table.strName) == 0) {
+      Table.Vendor = FindName(Table.Columns, "vendor");
+      Table.Model = FindName(Table.Columns, "model");
     }
+    Tables.push_back(Table);
   }
-}
-
-bool HasNull(const Database& Db, const ChangedTable& Table, const std::string& strSide) {
-  std::string strSql = "SELECT 1 FROM " + strSide + "." + Quoted(Table.strName) + " WHERE 0";
-  for (const std::string& strKey : Table.Keys) {
-    strSql += " OR " + Quoted(strKey) + " IS NULL";
-  }
-  return Statement(Db, strSql).Step();
-}
-
-// Returns the name of the index of the primary key, or "". The key of a table with a rowid may hold
-// NULL, even twice; then only the rowid identifies a row.
-std::string ReadKeys(const Database& Db, const Object& Object, ChangedTable* pTable) {
-  const std::vector<std::string> Index = Strings(
-      {Db, "SELECT name FROM pragma_index_list(?, 'before') WHERE origin = 'pk'"}, pTable->strName);
-  if (Index.empty()) {
-    pTable->Keys =
-        Strings({Db, "SELECT name FROM pragma_table_info(?, 'before') WHERE pk"}, pTable->strName);
-    pTable->Collations = {"BINARY"};
-    if (!pTable->Keys.empty()) {
-      pTable->strRowid = pTable->Keys[0];
-      return "";
-    }
-  } else {
-    const std::string strInfo = " FROM pragma_index_xinfo(?, 'before') WHERE key";
-    pTable->Keys = Strings({Db, "SELECT name" + strInfo}, Index[0]);
-    pTable->Collations = Strings({Db, "SELECT coll" + strInfo}, Index[0]);
-    if (Object.blWithoutRowid) {
-      pTable->strRowid.clear();
-      return "";
-    }
-    if (!HasNull(Db, *pTable, "before") && !HasNull(Db, *pTable, "after")) {
-      return Index[0];
-    }
-  }
-  if (pTable->strRowid.empty()) {
-    throw SqlFailure(SQLITE_ERROR, "columns hide every name of its rowid");
-  }
-  pTable->blRowidOnly = true;
-  pTable->Keys = {pTable->strRowid};
-  pTable->Collations = {"BINARY"};
-  return "";
+  return Tables;
 }
 
 // --- Rows that differ ---
 
 // Fills before_N and after_N. A single number is stored as the rowid, not twice. Indexes other than
 // the primary key's are not used: they may need what only the recorder has.
-void StoreRows(const Database& Db, const ChangedTable& Table, const std::string& strIndex) {
+void StoreRows(const Database& Db, const ChangedTable& Table) {
   const bool blNumber = Table.Keys.size() == 1 && Table.Keys[0] == Table.strRowid;
   const std::string strKeys = Numbered("k", Table.Keys);
   const bool blRowid = !blNumber && !Table.strRowid.empty();
@@ -148,7 +139,8 @@ void StoreRows(const Database& Db, const ChangedTable& Table, const std::string&
       {"keys", ForEach(Table.Keys, "t.{name}", ", ")},
       {"row", ForEach(Table.Columns, "t.{name}, ", "") +
                   (blRowid ? "t." + Quoted(Table.strRowid) : "NULL")},
-      {"by_key", strIndex.empty() ? "NOT INDEXED" : "INDEXED BY " + Quoted(strIndex)},
+      {"by_key",
+       Table.strKeyIndex.empty() ? "NOT INDEXED" : "INDEXED BY " + Quoted(Table.strKeyIndex)},
       {"same_keys", SameKeys(Table, "u", "t.{name}")},
       {"same_row", ForEach(Table.Columns, "(" + SameValue("u.{name}", "t.{name}") + ")", " AND ")},
       {"keys_before", Numbered("b.k", Table.Keys)},
@@ -170,71 +162,50 @@ void StoreRows(const Database& Db, const ChangedTable& Table, const std::string&
   }
 }
 
-bool HasChanges(const Database& Db, const ChangedTable& Table) {
-  const std::string strNumber = std::to_string(Table.Number);
-  return Statement(Db, "SELECT 1 FROM before_" + strNumber + " UNION ALL SELECT 1 FROM after_" +
-                           strNumber)
+bool HasNull(const Database& Db, const ChangedTable& Table, const std::string& strSide) {
+  return Statement(Db, "SELECT 1 FROM " + strSide + "." + Quoted(Table.strName) + " WHERE " +
+                           ForEach(Table.Keys, "{name} IS NULL", " OR "))
       .Step();
 }
 
-void DropRows(const Database& Db, const ChangedTable& Table) {
-  for (const char* szTable : {"before_", "after_"}) {
-    Db.Execute("DROP TABLE IF EXISTS " + (szTable + std::to_string(Table.Number)));
-  }
-}
-
-void Compare(const Database& Db, const Object& Object, ChangedTable* pTable) {
+// Creates before_N and after_N unless the table turns out not to be comparable. Then says why.
+void Compare(const Database& Db, ChangedTable Table) {
+  const std::string strNumber = std::to_string(Table.Number);
+  const std::string strThis = "number = " + strNumber;
+  std::string strReason = Table.strReason;
+  bool blDoubt = false;
   try {
-    ReadColumns(Db, pTable);
-    const std::string strIndex = ReadKeys(Db, Object, pTable);
-    // A collation that only the recorder has gets a clear message here.
-    const Statement Ordered(Db, "SELECT 1 FROM before." + Quoted(pTable->strName) + " ORDER BY " +
-                                    ForEach(pTable->Keys, "{name}", ", "));
-    StoreRows(Db, *pTable, strIndex);
-    if (Object.blShadow) {
-      pTable->blDoubt = HasChanges(Db, *pTable);
-      pTable->strReason = "holds the content of a virtual table";
+    if (Table.Columns.size() > MAX_COLUMNS) {
+      throw SqlFailure(SQLITE_ERROR, "more than " + std::to_string(MAX_COLUMNS) + " columns");
     }
+    // The key of a table with a rowid may hold NULL, even twice.
+    if (!Table.strKeyIndex.empty() &&
+        (HasNull(Db, Table, "before") || HasNull(Db, Table, "after"))) {
+      Db.Execute(USE_ROWID + strNumber);
+      Table = ReadCovered(Db, strThis)[0];
+    }
+    if (Table.blRowidOnly && Table.strRowid.empty()) {
+      throw SqlFailure(SQLITE_ERROR, "columns hide every name of its rowid");
+    }
+    // A collation that only the recorder has gets a clear message here.
+    const Statement Ordered(Db, "SELECT 1 FROM before." + Quoted(Table.strName) + " ORDER BY " +
+                                    ForEach(Table.Keys, "{name}", ", "));
+    StoreRows(Db, Table);
+    blDoubt = !strReason.empty() && !Db.Text("SELECT 1 FROM before_" + strNumber +
+                                             " UNION ALL SELECT 1 FROM after_" + strNumber)
+                                         .empty();
   } catch (const SqlFailure& Reason) {
-    // Such as a collation that only the recorder has.
     if (Reason.Code() != SQLITE_ERROR) {
       throw;
     }
-    pTable->strReason = Reason.what();
-    pTable->blDoubt = true;
+    strReason = Reason.what();
+    blDoubt = true;
   }
-  if (!pTable->strReason.empty()) {
-    DropRows(Db, *pTable);
+  if (!strReason.empty()) {
+    Db.Execute("DROP TABLE IF EXISTS before_" + strNumber);
+    Db.Execute("DROP TABLE IF EXISTS after_" + strNumber);
   }
-}
-
-// --- The other tables ---
-
-std::vector<Object> ListObjects(const Database& Db) {
-  Statement List(Db, OBJECTS);
-  std::vector<Object> Objects;
-  while (List.Step()) {
-    Object Next = {{}, List.Int(1) != 0, List.Int(5) != 0};
-    Next.Table.Number = static_cast<int>(Objects.size());
-    Next.Table.strName = List.Text(0);
-    Next.Table.strDefinition = List.Text(2);
-    Next.Table.blDoubt = !List.Text(3).empty();
-    Next.Table.strReason = Next.Table.blDoubt ? List.Text(3) : List.Text(4);
-    Objects.push_back(Next);
-  }
-  return Objects;
-}
-
-std::string JsonArray(const Database& Db, const std::vector<std::string>& Strings) {
-  std::string strArray = "[]";
-  Statement Append(Db, "SELECT json_insert(?, '$[#]', ?)");
-  for (const std::string& strString : Strings) {
-    Append.Bind(1, strArray);
-    Append.Bind(2, strString);
-    Append.Step();
-    strArray = Append.Text(0);
-  }
-  return strArray;
+  Db.Run("UPDATE covered SET reason = ?, doubt = ? WHERE " + strThis, strReason, int64_t{blDoubt});
 }
 
 }  // namespace
@@ -255,15 +226,11 @@ void MakeChangeFile(const std::string& strFile, const std::string& strBefore,
   Db.Execute(std::string("BEGIN;") + TABLES + APPLICATION_ID + "; PRAGMA user_version = " + FORMAT);
   Db.Run("INSERT INTO upgrade VALUES (?, ?, ?, ?, ?, ?, ?)", Info.strVersion, Info.strTool,
          Info.strToolVersion, Info.strTime, Info.strDatabase, Info.Inode, Info.SchemaVersion);
-  for (Object& Object : ListObjects(Db)) {
-    ChangedTable& Table = Object.Table;
-    if (Table.strReason.empty()) {
-      Compare(Db, Object, &Table);
-    }
-    Db.Run("INSERT INTO covered VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?)", int64_t{Table.Number},
-           Table.strName, JsonArray(Db, Table.Keys), JsonArray(Db, Table.Collations),
-           JsonArray(Db, Table.Columns), Table.strRowid, int64_t{Table.blRowidOnly},
-           Table.strDefinition, Table.strReason, int64_t{Table.blDoubt});
+  Db.Execute(LIST_TABLES);
+  Db.Execute(LIST_COLUMNS);
+  Db.Execute(USE_ROWID + std::string("NULL"));
+  for (const ChangedTable& Table : ReadCovered(Db, "doubt IS NULL")) {
+    Compare(Db, Table);
   }
   ListDangling(Db, "before", "main.dangling");
   Db.Execute("COMMIT");
@@ -292,30 +259,7 @@ Upgrade ReadUpgrade(const Database& Changes) {
 
 std::vector<ChangedTable> ReadTables(const Database& Changes) {
   ReadUpgrade(Changes);
-  const auto List = [&](const std::string& strArray) {
-    return Strings({Changes, "SELECT value FROM json_each(?)"}, strArray);
-  };
-  Statement Read(Changes, "SELECT * FROM covered ORDER BY number");
-  std::vector<ChangedTable> Tables;
-  while (Read.Step()) {
-    ChangedTable Table;
-    Table.Number = static_cast<int>(Read.Int(0));
-    Table.strName = Read.Text(1);
-    Table.Keys = List(Read.Text(2));
-    Table.Collations = List(Read.Text(3));
-    Table.Columns = List(Read.Text(4));
-    Table.strRowid = Read.Text(5);
-    Table.blRowidOnly = Read.Int(6) != 0;
-    Table.strDefinition = Read.Text(7);
-    Table.strReason = Read.Text(8);
-    Table.blDoubt = Read.Int(9) != 0;
-    if (FindName({"camera"}, Table.strName) == 0) {
-      Table.Vendor = FindName(Table.Columns, "vendor");
-      Table.Model = FindName(Table.Columns, "model");
-    }
-    Tables.push_back(Table);
-  }
-  return Tables;
+  return ReadCovered(Changes, "1");
 }
 
 int FindName(const std::vector<std::string>& Names, const std::string& strName) {

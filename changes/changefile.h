@@ -37,12 +37,13 @@ struct Upgrade {
 };
 
 struct ChangedTable {
-  int Number = 0;
+  int64_t Number = 0;
   std::string strName;
   std::vector<std::string> Keys;        // columns that identify a row, or a name of the rowid
   std::vector<std::string> Collations;  // of the keys
   std::vector<std::string> Columns;     // those that are not generated, in order
   std::string strRowid;                 // a name of the rowid; empty if there is none to use
+  std::string strKeyIndex;              // the index of the primary key, if a row is found by it
   bool blRowidOnly = false;   // nothing but the rowid identifies a row; VACUUM may change it
   std::string strDefinition;  // its CREATE statement
   // Why the table is not covered: then there are no before_N and after_N. Empty if it is covered.

@@ -27,7 +27,7 @@ struct Counts {
 
 // A row of row_N that must be left, and why.
 struct LeftRow {
-  int Number;
+  int64_t Number;
   int64_t Row;
   std::string strReason;
 };
