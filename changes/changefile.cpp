@@ -5,7 +5,6 @@
 #include <algorithm>
 
 #include "fileops.h"
-#include "value.h"
 
 namespace {
 
@@ -191,8 +190,8 @@ void Compare(const Database& Db, ChangedTable Table) {
     const Statement Ordered(Db, "SELECT 1 FROM before." + Quoted(Table.strName) + " ORDER BY " +
                                     ForEach(Table.Keys, "{name}", ", "));
     StoreRows(Db, Table);
-    blDoubt = !strReason.empty() && !Db.Text("SELECT 1 FROM before_" + strNumber +
-                                             " UNION ALL SELECT 1 FROM after_" + strNumber)
+    blDoubt = !strReason.empty() && !Db.Run("SELECT 1 FROM before_" + strNumber +
+                                            " UNION ALL SELECT 1 FROM after_" + strNumber)
                                          .empty();
   } catch (const SqlFailure& Reason) {
     if (Reason.Code() != SQLITE_ERROR) {
@@ -217,8 +216,7 @@ void MakeChangeFile(const std::string& strFile, const std::string& strBefore,
           .Get() == -1) {
     throw SystemFailure("cannot create " + strFile);
   }
-  const std::string strEncoding =
-      Database(strBefore, SQLITE_OPEN_READWRITE).Text("PRAGMA encoding");
+  const std::string strEncoding = Database(strBefore, SQLITE_OPEN_READWRITE).Run("PRAGMA encoding");
   Database Db(strFile, SQLITE_OPEN_READWRITE);
   Db.Execute(SETTINGS + Quoted(strEncoding));
   Db.Attach(strBefore, "before");
@@ -243,10 +241,10 @@ void AddFile(const Database& Changes, const std::string& strName, std::string_vi
 
 Upgrade ReadUpgrade(const Database& Changes) {
   const char* szFile = sqlite3_db_filename(Changes.Get(), "main");
-  if (Changes.Text("PRAGMA application_id") != APPLICATION_ID) {
+  if (Changes.Run("PRAGMA application_id") != APPLICATION_ID) {
     throw Failure(szFile + std::string(" is not a change file"));
   }
-  if (Changes.Text("PRAGMA user_version") != FORMAT) {
+  if (Changes.Run("PRAGMA user_version") != FORMAT) {
     throw Failure(szFile + std::string(" has the format of another version"));
   }
   Statement Read(Changes, "SELECT * FROM upgrade");
@@ -270,19 +268,6 @@ int FindName(const std::vector<std::string>& Names, const std::string& strName) 
   return Found == Names.end() ? -1 : static_cast<int>(Found - Names.begin());
 }
 
-std::string RowName(const ChangedTable& Table, const Statement& Row, int FirstKey,
-                    int FirstColumn) {
-  std::string strName = Name(Table.strName);
-  for (size_t Key = 0; Key < Table.Keys.size(); ++Key) {
-    strName += (Key == 0 ? " " : ", ") + Shown(Row.Value(FirstKey + static_cast<int>(Key)));
-  }
-  if (FirstColumn == -1 || !Table.IsCamera()) {
-    return strName;
-  }
-  return strName + " (" + Plain(Row.Value(FirstColumn + Table.Vendor)) + " " +
-         Plain(Row.Value(FirstColumn + Table.Model)) + ")";
-}
-
 // --- SQL ---
 
 std::string Numbered(const std::string& strPrefix, const std::vector<std::string>& Names) {
@@ -299,6 +284,20 @@ std::string SameKeys(const ChangedTable& Table, const std::string& strRow,
     strSql += Quoted(Table.Collations[Key]);
   }
   return strSql;
+}
+
+std::string RowName(const ChangedTable& Table, const std::string& strKey) {
+  return "shown_name(" + Literal(Table.strName) + ") || ' ' || " +
+         ForEach(Table.Keys, "shown(" + strKey + ")", " || ', ' || ");
+}
+
+std::string CameraName(const ChangedTable& Table, const std::string& strCell) {
+  const auto Cell = [&](int Column) {
+    return "plain(" + Fill(strCell, {{"i", std::to_string(Column)}}) + ")";
+  };
+  return Table.IsCamera()
+             ? "' (' || " + Cell(Table.Vendor) + " || ' ' || " + Cell(Table.Model) + " || ')'"
+             : "''";
 }
 
 void ListDangling(const Database& Db, const std::string& strSchema, const std::string& strList) {

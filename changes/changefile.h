@@ -72,11 +72,6 @@ std::vector<ChangedTable> ReadTables(const Database& Changes);
 // Returns the place of a name, which SQLite compares without regard to case, or -1.
 int FindName(const std::vector<std::string>& Names, const std::string& strName);
 
-// Names a row, such as "camera 12 (VENDOR MODEL)" or "TABLE 'a', 2". The statement's row has all
-// keys from column FirstKey on and all columns of the table from FirstColumn on. A FirstColumn of
-// -1 leaves the vendor and the model out.
-std::string RowName(const ChangedTable& Table, const Statement& Row, int FirstKey, int FirstColumn);
-
 // --- SQL ---
 
 // "x0, x1, ...", one for each name, with strPrefix in the place of x.
@@ -90,3 +85,8 @@ void ListDangling(const Database& Db, const std::string& strSchema, const std::s
 // of ForEach: "b.k{i}" for a row b of the change file, "t.{name}" for another row of the table.
 std::string SameKeys(const ChangedTable& Table, const std::string& strRow,
                      const std::string& strKey);
+
+// A text that names a row, such as "camera 12" or "TABLE 'a', 2", and what follows it for a camera,
+// " (VENDOR MODEL)". strKey and strCell stand for its keys and columns. Need AddPrintFunctions().
+std::string RowName(const ChangedTable& Table, const std::string& strKey);
+std::string CameraName(const ChangedTable& Table, const std::string& strCell);

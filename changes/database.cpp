@@ -59,11 +59,6 @@ void Database::Execute(const std::string& strSql) const {
   }
 }
 
-std::string Database::Text(const std::string& strSql) const {
-  Statement Query(*this, strSql);
-  return Query.Step() ? Query.Text(0) : "";
-}
-
 void Database::Throw(int Code) const { throw SqlFailure(Code, sqlite3_errmsg(m_pDb)); }
 
 Statement::Statement(const Database& Db, const std::string& strSql) : m_Db(Db) {

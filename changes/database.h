@@ -36,11 +36,10 @@ class Database {
   void AttachReadOnly(const std::string& strFile, const std::string& strSchema);
   void Attach(const std::string& strFile, const std::string& strSchema);
   void Execute(const std::string& strSql) const;
-  // Runs one statement with values for its parameters.
+  // Runs one statement with values for its parameters. Returns the first column of its first row;
+  // "" if there is none.
   template <typename... Values>
-  void Run(const std::string& strSql, const Values&... Parameters) const;
-  // Returns the first column of the first row; "" if there is no row.
-  std::string Text(const std::string& strSql) const;
+  std::string Run(const std::string& strSql, const Values&... Parameters) const;
   [[noreturn]] void Throw(int Code) const;
 
  private:
@@ -75,9 +74,9 @@ class Statement {
 };
 
 template <typename... Values>
-void Database::Run(const std::string& strSql, const Values&... Parameters) const {
+std::string Database::Run(const std::string& strSql, const Values&... Parameters) const {
   Statement Once(*this, strSql);
   int Parameter = 0;
   (Once.Bind(++Parameter, Parameters), ...);
-  Once.Step();
+  return Once.Step() ? Once.Text(0) : "";
 }

@@ -3,6 +3,7 @@
 #include <cmath>
 #include <cstdio>
 #include <cstdlib>
+#include <utility>
 
 namespace {
 
@@ -85,38 +86,6 @@ bool IsUtf8(const std::string& strText) {
 
 // --- SQL functions ---
 
-void ReturnJson(sqlite3_context* pContext, const std::string& strJson) {
-  sqlite3_result_text64(pContext, strJson.data(), strJson.size(), SQLITE_TRANSIENT, SQLITE_UTF8);
-  sqlite3_result_subtype(pContext, JSON_SUBTYPE);
-}
-
-void ReturnReal(sqlite3_context* pContext, double Real) {
-  const bool blInfinite = std::isinf(Real);
-  const char* szInfinity = Real > 0 ? R"({"real":"Inf"})" : R"({"real":"-Inf"})";
-  ReturnJson(pContext, blInfinite ? szInfinity : ShownReal(Real));
-}
-
-void ValueJson(sqlite3_context* pContext, int /*Count*/, sqlite3_value** ppValues) {
-  sqlite3_value* pValue = ppValues[0];
-  const int Type = sqlite3_value_type(pValue);
-  if (Type == SQLITE_FLOAT) {
-    ReturnReal(pContext, sqlite3_value_double(pValue));
-  } else if (Type == SQLITE_BLOB) {
-    ReturnJson(pContext, R"({"blob":")" + Hex(Bytes(pValue)) + "\"}");
-  } else if (Type == SQLITE_TEXT && !IsUtf8(Bytes(pValue))) {
-    ReturnJson(pContext, R"({"text":")" + Hex(Bytes(pValue)) + "\"}");
-  } else {
-    sqlite3_result_value(pContext, pValue);
-  }
-}
-
-void NameJson(sqlite3_context* pContext, int /*Count*/, sqlite3_value** ppValues) {
-  const std::string strName = Name(Bytes(ppValues[0]));
-  sqlite3_result_text64(pContext, strName.data(), strName.size(), SQLITE_TRANSIENT, SQLITE_UTF8);
-}
-
-}  // namespace
-
 std::string Plain(sqlite3_value* pValue) {
   switch (sqlite3_value_type(pValue)) {
     case SQLITE_INTEGER:
@@ -137,6 +106,40 @@ std::string Shown(sqlite3_value* pValue) {
   return blText ? "'" + Plain(pValue) + "'" : Plain(pValue);
 }
 
+std::string ShownName(sqlite3_value* pValue) { return Name(Bytes(pValue)); }
+
+template <std::string (*pFunction)(sqlite3_value*)>
+void ReturnText(sqlite3_context* pContext, int /*Count*/, sqlite3_value** ppValues) {
+  const std::string strText = pFunction(ppValues[0]);
+  sqlite3_result_text64(pContext, strText.data(), strText.size(), SQLITE_TRANSIENT, SQLITE_UTF8);
+}
+
+std::string RealJson(sqlite3_value* pValue) {
+  const double Real = sqlite3_value_double(pValue);
+  const char* szInfinity = Real > 0 ? R"({"real":"Inf"})" : R"({"real":"-Inf"})";
+  return std::isinf(Real) ? szInfinity : ShownReal(Real);
+}
+
+std::string HexJson(sqlite3_value* pValue) {
+  const bool blBlob = sqlite3_value_type(pValue) == SQLITE_BLOB;
+  return (blBlob ? R"({"blob":")" : R"({"text":")") + Hex(Bytes(pValue)) + "\"}";
+}
+
+void ValueJson(sqlite3_context* pContext, int Count, sqlite3_value** ppValues) {
+  const int Type = sqlite3_value_type(ppValues[0]);
+  if (Type == SQLITE_FLOAT) {
+    ReturnText<RealJson>(pContext, Count, ppValues);
+  } else if (Type == SQLITE_BLOB || (Type == SQLITE_TEXT && !IsUtf8(Bytes(ppValues[0])))) {
+    ReturnText<HexJson>(pContext, Count, ppValues);
+  } else {
+    sqlite3_result_value(pContext, ppValues[0]);
+    return;
+  }
+  sqlite3_result_subtype(pContext, JSON_SUBTYPE);
+}
+
+}  // namespace
+
 std::string Name(const std::string& strText) {
   std::string strShown;
   for (size_t Pos = 0; Pos < strText.size();) {
@@ -153,8 +156,11 @@ std::string Name(const std::string& strText) {
   return strShown;
 }
 
-void AddJsonFunctions(const Database& Db) {
-  constexpr int Flags = SQLITE_UTF8 | SQLITE_DETERMINISTIC;
-  sqlite3_create_function(Db.Get(), "value_json", 1, Flags, nullptr, ValueJson, nullptr, nullptr);
-  sqlite3_create_function(Db.Get(), "name_json", 1, Flags, nullptr, NameJson, nullptr, nullptr);
+void AddPrintFunctions(const Database& Db) {
+  for (const auto& [szName, pFunction] :
+       {std::pair("shown", ReturnText<Shown>), std::pair("plain", ReturnText<Plain>),
+        std::pair("shown_name", ReturnText<ShownName>), std::pair("value_json", ValueJson)}) {
+    sqlite3_create_function(Db.Get(), szName, 1, SQLITE_UTF8 | SQLITE_DETERMINISTIC, nullptr,
+                            pFunction, nullptr, nullptr);
+  }
 }

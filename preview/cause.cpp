@@ -29,16 +29,16 @@ bool FailsWithout(const Database& Db, const std::string& strSqlCmd, const std::s
 // not fail with either half.
 std::string LastRow(const Database& Db, const std::string& strSqlCmd, const std::string& strTable) {
   const std::string strFrom = " FROM " + strTable;
-  while (Db.Text("SELECT count(*)" + strFrom) != "1") {
+  while (Db.Run("SELECT count(*)" + strFrom) != "1") {
     const std::string strMiddle =
-        Db.Text("SELECT rowid" + strFrom + " ORDER BY rowid LIMIT 1 OFFSET (SELECT count(*) / 2" +
-                strFrom + ")");
+        Db.Run("SELECT rowid" + strFrom + " ORDER BY rowid LIMIT 1 OFFSET (SELECT count(*) / 2" +
+               strFrom + ")");
     if (!FailsWithout(Db, strSqlCmd, strTable + " WHERE rowid >= " + strMiddle) &&
         !FailsWithout(Db, strSqlCmd, strTable + " WHERE rowid < " + strMiddle)) {
       return "";
     }
   }
-  return Db.Text("SELECT rowid" + strFrom);
+  return Db.Run("SELECT rowid" + strFrom);
 }
 
 }  // namespace

@@ -53,7 +53,7 @@ int64_t CopyDatabase(const std::string& strFrom, const std::string& strTo) {
   try {
     const Database From(strFrom, SQLITE_OPEN_READWRITE);
     From.Execute("BEGIN");
-    const std::string strVersion = From.Text("PRAGMA schema_version");
+    const std::string strVersion = From.Run("PRAGMA schema_version");
     const Database To(strTo, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE);
     To.Execute("PRAGMA synchronous = OFF");  // nobody needs the copy after a power cut
     sqlite3_backup* const pBackup = sqlite3_backup_init(To.Get(), "main", From.Get(), "main");

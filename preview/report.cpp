@@ -10,10 +10,10 @@ namespace {
 // In all patterns, b is a row before the upgrade and a the same one after it, or b is a row of one
 // of both states. {i} is the place of a column, {text} its name.
 
-// For each row its keys and columns, and for each column a line if its cell has changed, else NULL.
+// For each row its name, and for each column a line if its cell has changed, else NULL.
 constexpr const char* CELLS = R"(
-  SELECT {keys}, {columns}, {lines} FROM before_{n} AS b JOIN after_{n} AS a ON {same_keys}
-  ORDER BY {keys})";
+  SELECT {name} || {camera_name}, {lines}
+  FROM before_{n} AS b JOIN after_{n} AS a ON {same_keys} ORDER BY {keys})";
 
 constexpr const char* TEXT_CELL =
     "' ' || shown_name({text}) || ': ' || shown(b.c{i}) || ' -> ' || shown(a.c{i})";
@@ -25,9 +25,9 @@ constexpr const char* JSON_CELL = R"(
 constexpr const char* JSON_CAMERA =
     ", 'vendor', value_json(b.c{vendor}), 'model', value_json(b.c{model})";
 
-// For each row of one state that the other lacks its keys, and one line.
+// For each row of one state that the other lacks its name, and one line.
 constexpr const char* ROWS = R"(
-  SELECT {keys}, {line} FROM {in}_{n} AS b
+  SELECT {name}, {line} FROM {in}_{n} AS b
   WHERE NOT EXISTS (SELECT 1 FROM {not_in}_{n} AS a WHERE {same_keys}) ORDER BY {keys})";
 
 constexpr const char* TEXT_ROW = R"(
@@ -36,7 +36,17 @@ constexpr const char* TEXT_ROW = R"(
 
 constexpr const char* JSON_ROW = R"(
   json_object('change', '{what}', {row}, 'values', (WITH field (name, value) AS (VALUES {fields})
-    SELECT json_group_object(name_json(name), value_json(value)) FROM field)))";
+    SELECT json_group_object(shown_name(name), value_json(value)) FROM field)))";
+
+constexpr const char* JSON_NOT_COMPARED = R"(
+  SELECT json_object('change', 'not compared', 'table', value_json(?), 'reason', value_json(?)))";
+
+constexpr const char* JSON_FILE =
+    "SELECT json_object('change', 'file', 'name', value_json(?), 'diff', value_json(?))";
+
+constexpr const char* JSON_FAILED = R"(
+  SELECT json_object('change', 'failed', 'action', value_json(?), 'reason', value_json(?),
+    'enough', value_json(?)))";
 
 constexpr const char* TEXT_SUMMARY =
     "{cells} cells in {cameras} cameras, {others} other cells, {added} rows added, "
@@ -54,23 +64,18 @@ std::string JsonRow(const ChangedTable& Table) {
          (Table.Keys.size() == 1 ? strKeys : "json_array(" + strKeys + ")");
 }
 
-WordMap MakeWords(const ChangedTable& Table) {
+WordMap MakeWords(const ChangedTable& Table, OutputMode Mode) {
+  const bool blText = Mode == OutputMode::TEXT;  // an object names its row itself
   return {{"n", std::to_string(Table.Number)},
+          {"name", blText ? RowName(Table, "b.k{i}") : "''"},
+          {"camera_name", blText ? CameraName(Table, "b.c{i}") : "''"},
           {"row", JsonRow(Table)},
+          {"camera", Table.IsCamera() ? Fill(JSON_CAMERA, {{"vendor", std::to_string(Table.Vendor)},
+                                                           {"model", std::to_string(Table.Model)}})
+                                      : ""},
           {"keys", Numbered("b.k", Table.Keys)},
-          {"columns", Numbered("b.c", Table.Columns)},
           {"same_keys", ForEach(Table.Keys, "a.k{i} = b.k{i}", " AND ")},
           {"fields", ForEach(Table.Columns, "({text}, b.c{i})", ", ")}};
-}
-
-std::string ShownName(sqlite3_value* pValue) {
-  return Name(reinterpret_cast<const char*>(sqlite3_value_text(pValue)));
-}
-
-template <std::string (*pFunction)(sqlite3_value*)>
-void TextFunction(sqlite3_context* pContext, int /*Count*/, sqlite3_value** ppValues) {
-  const std::string strText = pFunction(ppValues[0]);
-  sqlite3_result_text64(pContext, strText.data(), strText.size(), SQLITE_TRANSIENT, SQLITE_UTF8);
 }
 
 void Print(const std::string& strText) { fwrite(strText.data(), 1, strText.size(), stdout); }
@@ -80,32 +85,22 @@ void Print(const std::string& strText) { fwrite(strText.data(), 1, strText.size(
 Report::Report(const Database& Changes, OutputMode Mode, bool blCaps)
     : m_Changes(Changes), m_Mode(Mode) {
   m_Counts.Files = blCaps ? 0 : -1;
-  AddJsonFunctions(Changes);
-  for (const auto& [szName, pFunction] : {std::pair("shown", TextFunction<Shown>),
-                                          std::pair("shown_name", TextFunction<ShownName>)}) {
-    sqlite3_create_function(Changes.Get(), szName, 1, SQLITE_UTF8, nullptr, pFunction, nullptr,
-                            nullptr);
-  }
+  AddPrintFunctions(Changes);
 }
 
-// Runs a statement that selects the keys of rows, perhaps their columns, and then lines or NULLs.
-// Prints the lines, and counts them.
-int64_t Report::PrintLines(const ChangedTable& Table, const std::string& strSql, bool blColumns,
-                           int64_t* pRows) const {
+// Runs a statement that selects the names of rows, and then lines or NULLs. Prints the lines, and
+// counts them and the rows.
+int64_t Report::PrintLines(const std::string& strSql, int64_t* pRows) const {
   Statement Row(m_Changes, strSql);
-  const auto Columns = static_cast<int>(Table.Keys.size());
-  const int FirstLine = Columns + (blColumns ? static_cast<int>(Table.Columns.size()) : 0);
   int64_t Lines = 0;
   for (; Row.Step(); ++*pRows) {
-    const std::string strRow =
-        m_Mode == OutputMode::TEXT ? RowName(Table, Row, 0, blColumns ? Columns : -1) : "";
-    for (int Line = FirstLine; Line < sqlite3_column_count(Row.Get()); ++Line) {
+    for (int Line = 1; Line < sqlite3_column_count(Row.Get()); ++Line) {
       if (sqlite3_value_type(Row.Value(Line)) == SQLITE_NULL) {
         continue;
       }
       ++Lines;
       if (m_Mode == OutputMode::TEXT || m_Mode == OutputMode::JSON) {
-        Print(strRow + Row.Text(Line) + "\n");
+        Print(Row.Text(0) + Row.Text(Line) + "\n");
       }
     }
   }
@@ -118,25 +113,21 @@ void Report::Table(const ChangedTable& Table) {
     return;
   }
   const bool blJson = m_Mode == OutputMode::JSON;
-  const bool blCamera = Table.IsCamera();
-  WordMap Words = MakeWords(Table);
-  Words["camera"] = blCamera ? Fill(JSON_CAMERA, {{"vendor", std::to_string(Table.Vendor)},
-                                                  {"model", std::to_string(Table.Model)}})
-                             : "";
+  WordMap Words = MakeWords(Table, m_Mode);
   const std::string strCell = "CASE WHEN NOT (" + SameValue("a.c{i}", "b.c{i}") + ") THEN " +
                               (blJson ? JSON_CELL : TEXT_CELL) + " END";
   Words["lines"] = ForEach(Table.Columns, strCell, ", ", Words);
   int64_t Rows = 0;
-  const int64_t Cells = PrintLines(Table, Fill(CELLS, Words), true, &Rows);
-  (blCamera ? m_Counts.CameraCells : m_Counts.OtherCells) += Cells;
-  m_Counts.Cameras += blCamera ? Rows : 0;
+  const int64_t Cells = PrintLines(Fill(CELLS, Words), &Rows);
+  (Table.IsCamera() ? m_Counts.CameraCells : m_Counts.OtherCells) += Cells;
+  m_Counts.Cameras += Table.IsCamera() ? Rows : 0;
 
   const auto PrintRows = [&](const char* szWhat, const char* szIn, const char* szNotIn) {
     Words["what"] = szWhat;
     Words["line"] = Fill(blJson ? JSON_ROW : TEXT_ROW, Words);
     Words["in"] = szIn;
     Words["not_in"] = szNotIn;
-    return PrintLines(Table, Fill(ROWS, Words), false, &Rows);
+    return PrintLines(Fill(ROWS, Words), &Rows);
   };
   m_Counts.Removed += PrintRows("removed", "before", "after");
   m_Counts.Added += PrintRows("added", "after", "before");
@@ -147,7 +138,7 @@ void Report::NotCompared(const ChangedTable& Table) const {
     return;  // SQLite's own bookkeeping
   }
   if (m_Mode == OutputMode::JSON) {
-    PrintObject("not compared", {{"table", Table.strName}, {"reason", Table.strReason}});
+    Print(m_Changes.Run(JSON_NOT_COMPARED, Table.strName, Table.strReason) + "\n");
     return;
   }
   // --check has no output, but what it did not look at must be known.
@@ -155,27 +146,10 @@ void Report::NotCompared(const ChangedTable& Table) const {
           Name(Table.strName).c_str(), Name(Table.strReason).c_str());
 }
 
-// Prints an object with these texts as further members.
-void Report::PrintObject(const char* szChange,
-                         std::initializer_list<std::pair<const char*, std::string>> Texts) const {
-  std::string strMembers;
-  for (const auto& [szName, strText] : Texts) {
-    strMembers.append(", '").append(szName).append("', value_json(?)");
-  }
-  Statement Object(m_Changes, "SELECT json_object('change', ?" + strMembers + ")");
-  int Parameter = 1;
-  Object.Bind(Parameter++, std::string(szChange));
-  for (const auto& [szName, strText] : Texts) {
-    Object.Bind(Parameter++, strText);
-  }
-  Object.Step();
-  Print(Object.Text(0) + "\n");
-}
-
 void Report::File(const std::string& strName, const std::string& strDiff) {
   ++m_Counts.Files;
   if (m_Mode == OutputMode::JSON) {
-    PrintObject("file", {{"name", strName}, {"diff", strDiff}});
+    Print(m_Changes.Run(JSON_FILE, strName, strDiff) + "\n");
   } else if (m_Mode == OutputMode::TEXT) {
     Print(strDiff);
   }
@@ -183,8 +157,7 @@ void Report::File(const std::string& strName, const std::string& strDiff) {
 
 void Report::Failed(const FailedAction& Failed, const std::string& strCause) const {
   if (m_Mode == OutputMode::JSON) {
-    PrintObject("failed",
-                {{"action", Failed.strName}, {"reason", Failed.strReason}, {"enough", strCause}});
+    Print(m_Changes.Run(JSON_FAILED, Failed.strName, Failed.strReason, strCause) + "\n");
   } else if (m_Mode == OutputMode::TEXT) {
     const std::string strEnough = strCause.empty() ? "" : " (" + strCause + " alone is enough)";
     Print("failed: " + Name(Failed.strName) + ": " + Name(Failed.strReason) + strEnough + "\n");
@@ -202,7 +175,7 @@ void Report::Summary(int Status) const {
                          {"failed", std::to_string(All.Failed)},
                          {"status", std::to_string(Status)}};
   if (m_Mode == OutputMode::JSON) {
-    Print(m_Changes.Text(Fill(JSON_SUMMARY, Words)) + "\n");
+    Print(m_Changes.Run(Fill(JSON_SUMMARY, Words)) + "\n");
   } else if (m_Mode != OutputMode::CHECK) {
     Print(
         Fill(TEXT_SUMMARY, Words) +

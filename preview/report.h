@@ -2,9 +2,7 @@
 #pragma once
 
 #include <cstdint>
-#include <initializer_list>
 #include <string>
-#include <utility>
 
 #include "changefile.h"
 #include "database.h"
@@ -43,10 +41,7 @@ class Report {
 
  private:
   void NotCompared(const ChangedTable& Table) const;
-  int64_t PrintLines(const ChangedTable& Table, const std::string& strSql, bool blColumns,
-                     int64_t* pRows) const;
-  void PrintObject(const char* szChange,
-                   std::initializer_list<std::pair<const char*, std::string>> Texts) const;
+  int64_t PrintLines(const std::string& strSql, int64_t* pRows) const;
 
   const Database& m_Changes;
   const OutputMode m_Mode;

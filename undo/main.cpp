@@ -169,7 +169,7 @@ std::vector<TableUndo> TakeBack(const Database& Db, const Database& Original,
   std::vector<LeftRow> Left;
   while (true) {
     Db.Execute("BEGIN IMMEDIATE");
-    const bool blRebuilt = Original.Text("PRAGMA schema_version") != std::to_string(SchemaVersion);
+    const bool blRebuilt = Original.Run("PRAGMA schema_version") != std::to_string(SchemaVersion);
     std::vector<TableUndo> Tables;
     for (const ChangedTable& Table : Changed) {
       if (Table.strReason.empty()) {
@@ -192,6 +192,7 @@ std::vector<TableUndo> TakeBack(const Database& Db, const Database& Original,
 // Prints what is left. Nothing is printed of a database where all went back.
 Counts UndoDatabase(Database* pDb, const Database& Original, const std::string& strFile,
                     const Database& Changes) {
+  AddPrintFunctions(*pDb);
   pDb->AttachReadOnly(strFile, "changes");
   const std::vector<ChangedTable> Changed = ReadTables(Changes);
   const int64_t SchemaVersion = ReadUpgrade(Changes).SchemaVersion;

@@ -52,7 +52,7 @@ constexpr const char* LIST_REMOVED = R"(
     WHERE NOT EXISTS (SELECT 1 FROM changes.after_{n} AS a WHERE {a_is_b})))";
 
 constexpr const char* MERGE_CELL =
-    "CASE WHEN ({unchanged}) OR NOT ({as_after}) THEN {now} ELSE {before} END AS c{i}";
+    "CASE WHEN ({unchanged}) OR NOT ({as_after}) THEN t.{name} ELSE b.c{i} END AS c{i}";
 
 // The rows with cells of both sides: those that somebody has changed since stay.
 constexpr const char* MERGE = R"(
@@ -96,13 +96,17 @@ constexpr const char* SUMS = R"(
     total(lost) + total(back) FILTER (WHERE reason IS NOT NULL), total(done) FROM temp.row_{n})";
 
 // Of a changed row that is there, the cells that are as before are not left.
-constexpr const char* MARK_CELL = R"(
-  CASE WHEN x.kind = 'changed' AND (({unchanged}) OR (x.back + x.done > 0 AND {as_before}))
-    THEN '.' ELSE 'x' END)";
+constexpr const char* LEFT_CELL = R"(
+  ({text}, b.c{i}, a.c{i}, t.{name}, NOT (x.kind = 'changed'
+    AND (({unchanged}) OR (x.back + x.done > 0 AND {as_before})))))";
 
 constexpr const char* LEFT = R"(
-  SELECT x.kind, coalesce(x.reason, 'it has been changed since'), {present}, {marks}, {x_keys},
-    {b_columns}, {a_columns}, {t_columns}
+  SELECT 'left: ' || {name} || {camera_name} || ' ' || x.kind || (
+      WITH cell (name, before, after, now, named) AS (VALUES {cells})
+      SELECT ': before ' || iif(x.kind = 'added', 'none', {list_before})
+        || '; after ' || iif(x.kind = 'removed', 'none', {list_after})
+        || '; now ' || iif({present}, {list_now}, 'none') FROM cell WHERE named)
+    || ' (' || shown_name(coalesce(x.reason, 'it has been changed since')) || ')'
   FROM temp.row_{n} AS x LEFT JOIN changes.before_{n} AS b ON {x_is_b}
     LEFT JOIN changes.after_{n} AS a ON {x_is_a} LEFT JOIN main.{table} AS t ON {t_is_x}
   WHERE x.lost > 0 OR (x.back > 0 AND x.reason IS NOT NULL) ORDER BY x.rowid)";
@@ -110,8 +114,6 @@ constexpr const char* LEFT = R"(
 constexpr const char* ROWS = R"(
   SELECT count(*) FROM (SELECT {keys} FROM changes.before_{n} UNION
                         SELECT {keys} FROM changes.after_{n}))";
-
-constexpr int FIRST_KEY = 4;
 
 std::string SameStored(const ChangedTable& Table, const std::string& strA,
                        const std::string& strB) {
@@ -154,11 +156,14 @@ WordMap MakeWords(const ChangedTable& Table) {
       {"as_before", SameValue("t.{name}", "b.c{i}")},
       {"present", "{present}"},
       {"i", "{i}"},
-      {"now", "t.{name}"},
-      {"before", "b.c{i}"},
+      {"name", "{name}"},
+      {"text", "{text}"},
   };
   const auto EachCell = [&](const char* szPattern, const char* szBetween) {
     return ForEach(Columns, Fill(szPattern, Cell), szBetween, {{"present", strPresent}});
+  };
+  const auto List = [](const std::string& strValue) {
+    return "group_concat(shown_name(name) || '=' || shown(" + strValue + "), ', ')";
   };
   return {
       {"n", std::to_string(Table.Number)},
@@ -179,12 +184,14 @@ WordMap MakeWords(const ChangedTable& Table) {
       {"t_is_x", SameKeys(Table, "t", "x.k{i}")},
       {"t_as_a", EachCell("({as_after})", " AND ")},
       {"t_as_b", EachCell("({as_before})", " AND ")},
-      {"b_columns", Numbered("b.c", Columns)},
-      {"a_columns", Numbered("a.c", Columns)},
-      {"t_columns", ForEach(Columns, "t.{name}", ", ")},
+      {"name", RowName(Table, "x.k{i}")},
+      {"camera_name", CameraName(Table, "iif(x.kind = 'removed', b.c{i}, a.c{i})")},
       {"counts", EachCell(COUNT_CELL, " + ")},
       {"merged", EachCell(MERGE_CELL, ", ")},
-      {"marks", EachCell(MARK_CELL, " || ")},
+      {"cells", EachCell(LEFT_CELL, ", ")},
+      {"list_before", List("before")},
+      {"list_after", List("after")},
+      {"list_now", List("now")},
       {"rowid", blRowid ? "t." + strRowid : "0"},
       {"old_rowid", Table.blRowidOnly ? "k0"
                     : blRowid         ? "r"
@@ -274,31 +281,6 @@ void TableUndo::Print(Counts* pCounts) const {
   pCounts->Done += Sums.Int(2);
   Statement Left(m_Db, Fill(LEFT, m_Words));
   while (Left.Step()) {
-    PrintChange(Left);
+    puts(Left.Text(0).c_str());
   }
-}
-
-void TableUndo::PrintChange(const Statement& Row) const {
-  const std::string strMarks = Row.Text(3);
-  const auto Columns = static_cast<int>(m_Table.Columns.size());
-  const int Before = FIRST_KEY + static_cast<int>(m_Table.Keys.size());
-  const int After = Before + Columns;
-  const auto Values = [&](int First) {
-    std::string strValues;
-    for (int Column = 0; Column < Columns; ++Column) {
-      const auto Idx = static_cast<size_t>(Column);
-      if (strMarks[Idx] == 'x') {
-        strValues += (strValues.empty() ? "" : ", ") + Name(m_Table.Columns[Idx]) + "=";
-        strValues += Shown(Row.Value(First + Column));
-      }
-    }
-    return strValues;
-  };
-  const std::string strKind = Row.Text(0);
-  const bool blAdded = strKind == "added";
-  const bool blRemoved = strKind == "removed";
-  printf("left: %s %s: before %s; after %s; now %s (%s)\n",
-         RowName(m_Table, Row, FIRST_KEY, blRemoved ? Before : After).c_str(), strKind.c_str(),
-         blAdded ? "none" : Values(Before).c_str(), blRemoved ? "none" : Values(After).c_str(),
-         Row.Int(2) == 0 ? "none" : Values(After + Columns).c_str(), Name(Row.Text(1)).c_str());
 }

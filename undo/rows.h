@@ -58,7 +58,6 @@ class TableUndo {
  private:
   std::string FindReason(bool blRebuilt) const;
   void Execute(const char* szPattern) const { m_Db.Execute(Fill(szPattern, m_Words)); }
-  void PrintChange(const Statement& Row) const;
 
   const Database& m_Db;
   const ChangedTable m_Table;
