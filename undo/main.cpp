@@ -162,30 +162,34 @@ void CopyTo(const Database& From, const Database& To) {
 }
 
 // Takes back all rows that can go back, and leaves the transaction open. A row that cannot, because
-// of what others have done since, shows only when all have: then another transaction leaves it.
-std::vector<TableUndo> TakeBack(const Database& Db, const Database& Original,
-                                const std::vector<ChangedTable>& Changed, int64_t SchemaVersion) {
-  References References(Db);
-  std::vector<LeftRow> Left;
-  while (true) {
-    Db.Execute("BEGIN IMMEDIATE");
-    const bool blRebuilt = Original.Run("PRAGMA schema_version") != std::to_string(SchemaVersion);
-    std::vector<TableUndo> Tables;
-    for (const ChangedTable& Table : Changed) {
-      if (Table.strReason.empty()) {
-        Tables.emplace_back(Db, Table, blRebuilt).Classify(Left);
-      }
+// of what others have done since, shows only when all have: then they go back without it.
+std::vector<TableUndo> TakeBack(const Database& Db, const std::vector<ChangedTable>& Changed,
+                                bool blRebuilt) {
+  std::vector<TableUndo> Tables;
+  for (const ChangedTable& Table : Changed) {
+    if (Table.strReason.empty()) {
+      Tables.emplace_back(Db, Table, blRebuilt).Classify();
     }
-    References.Prepare(Tables, &Left);
-    const size_t Known = Left.size();
+  }
+  const References References(Db, Tables);
+  while (true) {
+    Db.Execute("SAVEPOINT attempt");
+    std::vector<LeftRow> Left;
     for (const TableUndo& Table : Tables) {
-      Table.Leave(Left);
       Table.Apply(&Left);
     }
-    if (Left.size() == Known && References.Check(Tables, &Left)) {
+    std::vector<BrokenReference> Broken;
+    if (Left.empty()) {
+      Broken = References.Check(&Left);
+    }
+    if (Left.empty() && Broken.empty()) {
       return Tables;
     }
-    Db.Execute("ROLLBACK");
+    Db.Execute("ROLLBACK TO attempt");
+    References.FindParents(Broken, &Left);
+    for (const TableUndo& Table : Tables) {
+      Table.Leave(Left);
+    }
   }
 }
 
@@ -195,8 +199,10 @@ Counts UndoDatabase(Database* pDb, const Database& Original, const std::string& 
   AddPrintFunctions(*pDb);
   pDb->AttachReadOnly(strFile, "changes");
   const std::vector<ChangedTable> Changed = ReadTables(Changes);
-  const int64_t SchemaVersion = ReadUpgrade(Changes).SchemaVersion;
-  const std::vector<TableUndo> Tables = TakeBack(*pDb, Original, Changed, SchemaVersion);
+  pDb->Execute("BEGIN IMMEDIATE");
+  const bool blRebuilt =
+      Original.Run("PRAGMA schema_version") != std::to_string(ReadUpgrade(Changes).SchemaVersion);
+  const std::vector<TableUndo> Tables = TakeBack(*pDb, Changed, blRebuilt);
   Counts Counts;
   for (const ChangedTable& Table : Changed) {
     if (!Table.strReason.empty()) {

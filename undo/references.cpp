@@ -1,7 +1,5 @@
 #include "references.h"
 
-#include <algorithm>
-
 namespace {
 
 constexpr const char* LISTS = R"(
@@ -14,6 +12,11 @@ constexpr const char* NEWLY_BROKEN = R"(
     SELECT 1 FROM (SELECT * FROM temp.broken_before UNION ALL SELECT * FROM changes.dangling) AS b
     WHERE b.child = n.child AND b.row IS n.row AND b.parent = n.parent AND b.id = n.id
       AND b.count >= n.count))";
+
+// There is no row to leave for a reference: it may lead nowhere, however often.
+constexpr const char* ACCEPT = R"(
+  INSERT INTO temp.broken_before
+  VALUES (?, CAST(nullif(?, '') AS INTEGER), ?, ?, 9223372036854775807))";
 
 // A foreign key without column names leads to the primary key.
 constexpr const char* COLUMNS = R"(
@@ -30,14 +33,15 @@ constexpr const char* CHILDREN = R"(
 constexpr const char* PARENTS = R"(
   SELECT x.rowid FROM temp.row_{n} AS x JOIN main.{parent} AS p ON {p_is_x}
     JOIN main.{child} AS c ON {leads}
-    LEFT JOIN changes.before_{n} AS b ON {b_is_x} LEFT JOIN changes.after_{n} AS a ON {a_is_x}
+    LEFT JOIN changes.before_{n} AS b USING ({keys})
+    LEFT JOIN changes.after_{n} AS a USING ({keys})
   WHERE {goes_back} AND {is_row} AND (x.kind = 'added' OR {moves}))";
 
 }  // namespace
 
 // The words of a pattern for the table that x is a row of: {leads} is true if the row p is the one
 // that the row c refers to, and {moves} if the upgrade has changed the value that it refers to.
-WordMap References::Describe(const ChangedTable& Table, const Broken& Reference) const {
+WordMap References::Describe(const ChangedTable& Table, const BrokenReference& Reference) const {
   std::string strLeads = "1";
   std::string strRefers = "1";
   std::string strMoves = "0";
@@ -58,20 +62,19 @@ WordMap References::Describe(const ChangedTable& Table, const Broken& Reference)
           {"is_row", Reference.strRow.empty() ? "1" : "c.rowid = " + Reference.strRow},
           {"c_is_x", SameKeys(Table, "c", "x.k{i}")},
           {"p_is_x", SameKeys(Table, "p", "x.k{i}")},
-          {"b_is_x", ForEach(Table.Keys, "b.k{i} = x.k{i}", " AND ")},
-          {"a_is_x", ForEach(Table.Keys, "a.k{i} = x.k{i}", " AND ")},
+          {"keys", Numbered("k", Table.Keys)},
           {"leads", strLeads},
           {"refers", strRefers},
           {"moves", strMoves}};
 }
 
 // Appends the rows of the table strTable that the pattern finds. Returns false if there are none.
-bool References::Find(const std::vector<TableUndo>& Tables, const std::string& strTable,
-                      const char* szPattern, const Broken& Reference, const std::string& strReason,
+bool References::Find(const std::string& strTable, const char* szPattern,
+                      const BrokenReference& Reference, const std::string& strReason,
                       std::vector<LeftRow>* pLeft) const {
   const size_t Known = pLeft->size();
-  for (const TableUndo& Undo : Tables) {
-    if (sqlite3_stricmp(Undo.Table().strName.c_str(), strTable.c_str()) == 0) {
+  for (const TableUndo& Undo : m_Tables) {
+    if (Undo.CanGoBack() && FindName({strTable}, Undo.Table().strName) == 0) {
       Statement Rows(m_Db, Fill(szPattern, Describe(Undo.Table(), Reference)));
       while (Rows.Step()) {
         pLeft->push_back({Undo.Table().Number, Rows.Int(0), strReason});
@@ -81,32 +84,32 @@ bool References::Find(const std::vector<TableUndo>& Tables, const std::string& s
   return pLeft->size() > Known;
 }
 
-void References::Prepare(const std::vector<TableUndo>& Tables, std::vector<LeftRow>* pLeft) {
+References::References(const Database& Db, const std::vector<TableUndo>& Tables)
+    : m_Db(Db), m_Tables(Tables) {
   m_Db.Execute(LISTS);
   ListDangling(m_Db, "main", "temp.broken_before");
-  for (const Broken& Reference : m_Missed) {
-    const std::string strReason = "a row of " + Reference.strChild + " refers to it";
-    if (!Find(Tables, Reference.strParent, PARENTS, Reference, strReason, pLeft)) {
-      m_Accepted.push_back(Reference);
-    }
-  }
-  m_Missed.clear();
 }
 
-bool References::Check(const std::vector<TableUndo>& Tables, std::vector<LeftRow>* pLeft) {
+std::vector<BrokenReference> References::Check(std::vector<LeftRow>* pLeft) const {
   ListDangling(m_Db, "main", "temp.broken_now");
-  bool blWhole = true;
+  std::vector<BrokenReference> Missed;
   Statement New(m_Db, NEWLY_BROKEN);
   while (New.Step()) {
-    const Broken Reference = {New.Text(0), New.Text(1), New.Text(2), New.Int(3)};
-    if (std::find(m_Accepted.begin(), m_Accepted.end(), Reference) != m_Accepted.end()) {
-      continue;
-    }
-    blWhole = false;
+    const BrokenReference Reference = {New.Text(0), New.Text(1), New.Text(2), New.Int(3)};
     const std::string strReason = "it refers to a row of " + Reference.strParent + " that is gone";
-    if (!Find(Tables, Reference.strChild, CHILDREN, Reference, strReason, pLeft)) {
-      m_Missed.push_back(Reference);
+    if (!Find(Reference.strChild, CHILDREN, Reference, strReason, pLeft)) {
+      Missed.push_back(Reference);
     }
   }
-  return blWhole;
+  return Missed;
+}
+
+void References::FindParents(const std::vector<BrokenReference>& Broken,
+                             std::vector<LeftRow>* pLeft) const {
+  for (const BrokenReference& Reference : Broken) {
+    const std::string strReason = "a row of " + Reference.strChild + " refers to it";
+    if (!Find(Reference.strParent, PARENTS, Reference, strReason, pLeft)) {
+      m_Db.Run(ACCEPT, Reference.strChild, Reference.strRow, Reference.strParent, Reference.Id);
+    }
+  }
 }

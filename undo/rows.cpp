@@ -10,57 +10,52 @@ namespace {
 // In all patterns, t is the row of the table, b and a are the row before and after the upgrade, and
 // x is the row of row_N.
 
-constexpr const char* CREATE_LIST =
-    "CREATE TEMP TABLE row_{n} ({keys}, kind, back, done, lost, whole, r, reason)";
-
-// Adds up four counts in one number, and then takes them apart: changes to set back, as before
-// already and changed since, and other columns that have been changed since. A part of a row may be
-// as before, because an upgrade can be killed.
-constexpr const char* LIST_CHANGED = R"(
-  INSERT INTO temp.row_{n}
+// {counts} adds up four counts in one number, and the rest takes them apart: changes to set back,
+// as before already and changed since, and other columns that have been changed since. A part of a
+// row may be as before, because an upgrade can be killed.
+constexpr const char* LIST = R"(
+  CREATE TEMP TABLE row_{n} AS
   WITH counted AS MATERIALIZED (  -- so that each count is made once
-    SELECT {b_keys}, {counts} AS n, {rowid} AS now_r, CASE WHEN NOT {present} THEN 'the row is gone'
-      WHEN NOT ({same_camera}) THEN 'it is another camera now' END AS other
-    FROM changes.before_{n} AS b CROSS JOIN changes.after_{n} AS a ON {a_is_b}
-      LEFT JOIN main.{table} AS t ON {t_is_b})
-  SELECT {keys}, 'changed', n % 1024, n / 1024 % 1024, n / 1048576 % 1024, n < 1048576, now_r,
-    CASE WHEN other IS NULL AND n >= 1048576 AND NOT {is_camera}
-      THEN 'the row has been changed since' ELSE other END
-  FROM counted)";
+    SELECT {x_keys}, {present} AS present, {counts} AS n, {same_camera} AS same_camera,
+      CASE WHEN b.k0 IS NULL THEN 'added' WHEN a.k0 IS NULL THEN 'removed' ELSE 'changed' END
+        AS kind,
+      iif(a.k0 IS NULL, {old_rowid}, {rowid}) AS r
+    FROM (SELECT {keys} FROM changes.before_{n} UNION SELECT {keys} FROM changes.after_{n}) AS x
+      LEFT JOIN changes.before_{n} AS b USING ({keys})
+      LEFT JOIN changes.after_{n} AS a USING ({keys}) LEFT JOIN main.{table} AS t ON {t_is_x}),
+  judged AS (
+    SELECT *,
+      CASE kind WHEN 'changed' THEN n % 1024 WHEN 'added' THEN present AND n < 1024
+        ELSE NOT present END AS back,
+      CASE kind WHEN 'changed' THEN n / 1024 % 1024 WHEN 'added' THEN NOT present
+        ELSE present AND n % 1024 = 0 AND n < 1048576 END AS done
+    FROM counted)
+  SELECT {keys}, kind, back, done,
+    iif(kind = 'changed', n / 1048576 % 1024, 1 - back - done) AS lost, n < 1048576 AS whole, r,
+    CASE
+      WHEN kind = 'changed' AND NOT present THEN 'the row is gone'
+      WHEN kind = 'changed' AND NOT same_camera THEN 'it is another camera now'
+      WHEN kind = 'removed' AND back + done = 0 THEN 'another row has its key'
+      WHEN kind = 'added' AND back + done = 0 THEN 'the row has been changed since'
+      WHEN kind = 'changed' AND n >= 1048576 AND NOT {is_camera}
+        THEN 'the row has been changed since'
+    END AS reason
+  FROM judged)";
 
 constexpr const char* COUNT_CELL = R"(
   CASE WHEN {unchanged} THEN CASE WHEN {as_after} THEN 0 ELSE 1073741824 END
     WHEN NOT {present} THEN 1048576
     WHEN {as_after} THEN 1 WHEN {as_before} THEN 1024 ELSE 1048576 END)";
 
-constexpr const char* LIST_ADDED = R"(
-  INSERT INTO temp.row_{n}
-  SELECT {keys}, 'added', present AND as_after, NOT present, present AND NOT as_after, 1, 0,
-    CASE WHEN present AND NOT as_after THEN 'the row has been changed since' END
-  FROM (
-    SELECT a.*, {present} AS present, {t_as_a} AS as_after
-    FROM changes.after_{n} AS a LEFT JOIN main.{table} AS t ON {t_is_a}
-    WHERE NOT EXISTS (SELECT 1 FROM changes.before_{n} AS b WHERE {a_is_b})))";
-
-constexpr const char* LIST_REMOVED = R"(
-  INSERT INTO temp.row_{n}
-  SELECT {keys}, 'removed', NOT present, present AND as_before, present AND NOT as_before, 1,
-    {old_rowid}, CASE WHEN present AND NOT as_before THEN 'another row has its key' END
-  FROM (
-    SELECT b.*, {present} AS present, {t_as_b} AS as_before
-    FROM changes.before_{n} AS b LEFT JOIN main.{table} AS t ON {t_is_b}
-    WHERE NOT EXISTS (SELECT 1 FROM changes.after_{n} AS a WHERE {a_is_b})))";
-
-constexpr const char* MERGE_CELL =
-    "CASE WHEN ({unchanged}) OR NOT ({as_after}) THEN t.{name} ELSE b.c{i} END AS c{i}";
-
-// The rows with cells of both sides: those that somebody has changed since stay.
+// The rows to insert. What somebody has changed since stays.
 constexpr const char* MERGE = R"(
-  CREATE TEMP TABLE merged_{n} AS
-  SELECT {x_keys}, {merged} FROM temp.row_{n} AS x
-    CROSS JOIN changes.before_{n} AS b ON {x_is_b} CROSS JOIN changes.after_{n} AS a ON {a_is_b}
-    CROSS JOIN main.{table} AS t ON {t_is_b}
-  WHERE {goes_back} AND x.kind = 'changed' AND NOT x.whole)";
+  CREATE TEMP TABLE merged_{n} AS SELECT x.r, {merged}
+  FROM temp.row_{n} AS x CROSS JOIN changes.before_{n} AS b USING ({keys})
+    LEFT JOIN changes.after_{n} AS a USING ({keys}) LEFT JOIN main.{table} AS t ON {t_is_x}
+  WHERE {goes_back} AND x.kind <> 'added')";
+
+constexpr const char* MERGE_CELL = R"(
+  CASE WHEN x.whole OR (NOT ({unchanged}) AND {as_after}) THEN b.c{i} ELSE t.{name} END AS c{i})";
 
 constexpr const char* DELETE = R"(
   DELETE FROM main.{table} WHERE ({collated_keys}) IN (
@@ -68,23 +63,12 @@ constexpr const char* DELETE = R"(
 
 // A removed row gets another rowid if its own has been given to another row.
 constexpr const char* FREE_ROWIDS = R"(
-  UPDATE temp.row_{n} AS x SET r = NULL WHERE x.kind = 'removed' AND EXISTS (
+  UPDATE temp.merged_{n} AS x SET r = NULL WHERE EXISTS (
     SELECT 1 FROM main.{table} AS t WHERE {rowid} = x.r))";
 
 // The table's own answers to a conflict, such as REPLACE, do not count here.
-constexpr const char* INSERT_MERGED = R"(
-  INSERT OR IGNORE INTO main.{table} ({columns}) SELECT {values}
-  FROM temp.merged_{n} AS b JOIN temp.row_{n} AS x ON {x_is_b})";
-
-constexpr const char* INSERT_WHOLE = R"(
-  INSERT OR IGNORE INTO main.{table} ({columns}) SELECT {values}
-  FROM temp.row_{n} AS x CROSS JOIN changes.before_{n} AS b ON {x_is_b}
-  WHERE {goes_back} AND x.kind <> 'added' AND x.whole AND x.r IS NOT NULL)";
-
-constexpr const char* INSERT_WITHOUT_ROWID = R"(
-  INSERT OR IGNORE INTO main.{table} ({columns}) SELECT {values}
-  FROM temp.row_{n} AS x CROSS JOIN changes.before_{n} AS b ON {x_is_b}
-  WHERE {goes_back} AND x.kind <> 'added' AND x.whole AND x.r IS NULL)";
+constexpr const char* INSERT = R"(
+  INSERT OR IGNORE INTO main.{table} ({columns}) SELECT {values} FROM temp.merged_{n} WHERE )";
 
 constexpr const char* REFUSED = R"(
   SELECT x.rowid FROM temp.row_{n} AS x
@@ -107,18 +91,14 @@ constexpr const char* LEFT = R"(
         || '; after ' || iif(x.kind = 'removed', 'none', {list_after})
         || '; now ' || iif({present}, {list_now}, 'none') FROM cell WHERE named)
     || ' (' || shown_name(coalesce(x.reason, 'it has been changed since')) || ')'
-  FROM temp.row_{n} AS x LEFT JOIN changes.before_{n} AS b ON {x_is_b}
-    LEFT JOIN changes.after_{n} AS a ON {x_is_a} LEFT JOIN main.{table} AS t ON {t_is_x}
-  WHERE x.lost > 0 OR (x.back > 0 AND x.reason IS NOT NULL) ORDER BY x.rowid)";
+  FROM temp.row_{n} AS x LEFT JOIN changes.before_{n} AS b USING ({keys})
+    LEFT JOIN changes.after_{n} AS a USING ({keys}) LEFT JOIN main.{table} AS t ON {t_is_x}
+  WHERE x.lost > 0 OR (x.back > 0 AND x.reason IS NOT NULL)
+  ORDER BY x.kind <> 'changed', x.kind, x.rowid)";
 
 constexpr const char* ROWS = R"(
   SELECT count(*) FROM (SELECT {keys} FROM changes.before_{n} UNION
                         SELECT {keys} FROM changes.after_{n}))";
-
-std::string SameStored(const ChangedTable& Table, const std::string& strA,
-                       const std::string& strB) {
-  return ForEach(Table.Keys, strA + ".k{i} = " + strB + ".k{i}", " AND ");
-}
 
 std::string CollatedKeys(const ChangedTable& Table) {
   std::string strSql;
@@ -173,17 +153,9 @@ WordMap MakeWords(const ChangedTable& Table) {
       {"is_camera", Table.IsCamera() ? "1" : "0"},
       {"same_camera", SameCamera(Table)},
       {"keys", Numbered("k", Table.Keys)},
-      {"b_keys", Numbered("b.k", Table.Keys)},
       {"x_keys", Numbered("x.k", Table.Keys)},
       {"collated_keys", CollatedKeys(Table)},
-      {"a_is_b", SameStored(Table, "a", "b")},
-      {"x_is_a", SameStored(Table, "x", "a")},
-      {"x_is_b", SameStored(Table, "x", "b")},
-      {"t_is_a", SameKeys(Table, "t", "a.k{i}")},
-      {"t_is_b", SameKeys(Table, "t", "b.k{i}")},
       {"t_is_x", SameKeys(Table, "t", "x.k{i}")},
-      {"t_as_a", EachCell("({as_after})", " AND ")},
-      {"t_as_b", EachCell("({as_before})", " AND ")},
       {"name", RowName(Table, "x.k{i}")},
       {"camera_name", CameraName(Table, "iif(x.kind = 'removed', b.c{i}, a.c{i})")},
       {"counts", EachCell(COUNT_CELL, " + ")},
@@ -193,11 +165,11 @@ WordMap MakeWords(const ChangedTable& Table) {
       {"list_after", List("after")},
       {"list_now", List("now")},
       {"rowid", blRowid ? "t." + strRowid : "0"},
-      {"old_rowid", Table.blRowidOnly ? "k0"
-                    : blRowid         ? "r"
+      {"old_rowid", Table.blRowidOnly ? "x.k0"
+                    : blRowid         ? "b.r"
                                       : "0"},
       {"columns", (blRowid ? strRowid + ", " : "") + ForEach(Columns, "{name}", ", ")},
-      {"values", (blRowid ? "x.r, " : "") + Numbered("b.c", Columns)},
+      {"values", (blRowid ? "r, " : "") + Numbered("c", Columns)},
   };
 }
 
@@ -225,14 +197,10 @@ std::string TableUndo::FindReason(bool blRebuilt) const {
   }
 }
 
-void TableUndo::Classify(const std::vector<LeftRow>& Left) const {
-  Execute(CREATE_LIST);
-  if (m_strReason.empty()) {
-    Execute(LIST_CHANGED);
-    Execute(LIST_ADDED);
-    Execute(LIST_REMOVED);
+void TableUndo::Classify() const {
+  if (CanGoBack()) {
+    Execute(LIST);
   }
-  Leave(Left);
 }
 
 void TableUndo::Leave(const std::vector<LeftRow>& Left) const {
@@ -245,7 +213,7 @@ void TableUndo::Leave(const std::vector<LeftRow>& Left) const {
 }
 
 void TableUndo::Apply(std::vector<LeftRow>* pLeft) const {
-  if (!m_strReason.empty()) {
+  if (!CanGoBack()) {
     return;
   }
   Execute(MERGE);
@@ -253,9 +221,9 @@ void TableUndo::Apply(std::vector<LeftRow>* pLeft) const {
   if (HasOwnRowid(m_Table) && !m_Table.blRowidOnly) {
     Execute(FREE_ROWIDS);
   }
-  for (const char* szPattern : {INSERT_MERGED, INSERT_WHOLE, INSERT_WITHOUT_ROWID}) {
-    Execute(szPattern);
-  }
+  // First the rows whose rowid is known, so that no other row gets it.
+  Execute(INSERT + std::string("r IS NOT NULL"));
+  Execute(INSERT + std::string("r IS NULL"));
   Statement Refused(m_Db, Fill(REFUSED, m_Words));
   while (Refused.Step()) {
     pLeft->push_back({m_Table.Number, Refused.Int(0), "UNIQUE, CHECK or NOT NULL forbids it now"});
@@ -265,7 +233,7 @@ void TableUndo::Apply(std::vector<LeftRow>* pLeft) const {
 // --- What is left ---
 
 void TableUndo::Print(Counts* pCounts) const {
-  if (!m_strReason.empty()) {
+  if (!CanGoBack()) {
     Statement Rows(m_Db, Fill(ROWS, m_Words));
     if (Rows.Step() && Rows.Int(0) > 0) {
       printf("left: %s: %" PRId64 " rows (%s)\n", Name(m_Table.strName).c_str(), Rows.Int(0),

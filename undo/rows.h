@@ -6,10 +6,8 @@
 //   back, done, lost  how many of its changes are to be set back, are as before already, and have
 //                     been changed since
 //   whole             each of its columns holds its value before or after the upgrade
-//   r                 its rowid, if no column holds it
+//   r                 the rowid that it is to have, if no column holds it
 //   reason            why the whole row is left, or NULL
-// The rowids of row_N depend on the change file alone, so that they name a row in a later
-// transaction, too.
 #pragma once
 
 #include <cstdint>
@@ -25,7 +23,7 @@ struct Counts {
   int64_t Done = 0;  // as before already
 };
 
-// A row of row_N that must be left, and why.
+// A row of row_N, by its rowid, that must be left, and why.
 struct LeftRow {
   int64_t Number;
   int64_t Row;
@@ -44,8 +42,13 @@ class TableUndo {
 
   const ChangedTable& Table() const { return m_Table; }
 
-  // Creates row_N. Leaves the rows of Left that belong to this table, as Leave does.
-  void Classify(const std::vector<LeftRow>& Left) const;
+  // True if rows of the table can go back. Only then is there a row_N.
+  bool CanGoBack() const { return m_strReason.empty(); }
+
+  // Creates row_N.
+  void Classify() const;
+
+  // Marks the rows of Left that belong to this table, so that they stay.
   void Leave(const std::vector<LeftRow>& Left) const;
 
   // Takes back what goes back. All rows go before the first comes back, because SQLite checks
@@ -57,7 +60,7 @@ class TableUndo {
 
  private:
   std::string FindReason(bool blRebuilt) const;
-  void Execute(const char* szPattern) const { m_Db.Execute(Fill(szPattern, m_Words)); }
+  void Execute(const std::string& strPattern) const { m_Db.Execute(Fill(strPattern, m_Words)); }
 
   const Database& m_Db;
   const ChangedTable m_Table;
