@@ -195,8 +195,8 @@ int main(int argc, char* argv[]) {
     if (Options.Status >= 0) {
       return fflush(stdout) == 0 ? Options.Status : Fail("cannot write the output");
     }
-    return RunSupervised(
-        [&](const std::string& strWorkDir) { return Preview(Options, strWorkDir); });
+    const WorkDirectory WorkDir;
+    return Preview(Options, WorkDir.Name());
   } catch (const std::exception& Reason) {
     return Fail(Reason.what());
   }

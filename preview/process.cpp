@@ -21,57 +21,6 @@ namespace {
 
 constexpr size_t MAX_RECORD_BYTES = 65536;
 
-// Starts a child that dies with this process. Returns 0 in the child, else its id. Throws Failure.
-pid_t Fork() {
-  const pid_t Parent = getpid();
-  const pid_t Child = fork();
-  if (Child == -1) {
-    throw SystemFailure("cannot start a process");
-  }
-  if (Child == 0) {
-    prctl(PR_SET_PDEATHSIG, SIGKILL);
-    if (getppid() != Parent) {  // it has ended already
-      _exit(1);
-    }
-  }
-  return Child;
-}
-
-// Blocks and returns SIGCHLD and the signals that would end this process.
-sigset_t BlockSignals() {
-  sigset_t Signals;
-  sigemptyset(&Signals);
-  for (const int Signal : {SIGINT, SIGTERM, SIGHUP, SIGQUIT, SIGPIPE, SIGALRM, SIGUSR1, SIGUSR2}) {
-    struct sigaction Action;
-    if (sigaction(Signal, nullptr, &Action) == 0 && Action.sa_handler != SIG_IGN) {
-      sigaddset(&Signals, Signal);
-    }
-  }
-  signal(SIGCHLD, SIG_DFL);
-  sigaddset(&Signals, SIGCHLD);
-  sigprocmask(SIG_BLOCK, &Signals, nullptr);
-  return Signals;
-}
-
-// Waits for the child to end, and kills it if a signal arrives. Returns the signal that ended it or
-// arrived; 0 if there was none.
-int WaitForChild(pid_t Child, const sigset_t& Signals, int* pStatus) {
-  int Caught = 0;
-  while (waitpid(Child, pStatus, WNOHANG) != Child) {
-    int Signal = 0;
-    sigwait(&Signals, &Signal);
-    if (Signal != SIGCHLD) {
-      Caught = Signal;
-      kill(Child, SIGKILL);
-    }
-  }
-  // Descendants of the child die with it and become children of this process. Some emulators do
-  // not hand them over.
-  while (wait(nullptr) != -1 || errno == EINTR) {
-  }
-  return Caught == 0 && WIFSIGNALED(*pStatus) ? WTERMSIG(*pStatus) : Caught;
-}
-
 [[noreturn]] void Become(const std::vector<std::string>& Arguments, int OutputFd) {
   std::vector<char*> Argv;
   Argv.reserve(Arguments.size() + 1);
@@ -115,33 +64,49 @@ void Collect(int OutputFd, int SyslogFd, CommandResult* pResult) {
   }
 }
 
-}  // namespace
-
-int RunSupervised(const std::function<int(const std::string& strWorkDir)>& Work) {
-  const char* szTmpDir = getenv("TMPDIR");
-  const std::string strTmpDir = szTmpDir == nullptr || *szTmpDir == '\0' ? "/tmp" : szTmpDir;
-  sigset_t Before;
-  sigprocmask(SIG_SETMASK, nullptr, &Before);
-  const sigset_t Signals = BlockSignals();
-  prctl(PR_SET_CHILD_SUBREAPER, 1);
-  std::string strDir = std::filesystem::absolute(strTmpDir + "/tessel-preview.XXXXXX");
-  if (mkdtemp(strDir.data()) == nullptr) {
-    throw SystemFailure("cannot make a directory in " + strTmpDir);
+// Waits until every process that holds the other end of the pipe has ended.
+[[noreturn]] void CleanUp(const int* rgPipe, const std::string& strDir) {
+  close(rgPipe[1]);
+  char Byte;
+  while (read(rgPipe[0], &Byte, 1) == -1 && errno == EINTR) {
   }
-  const pid_t Child = Fork();
-  if (Child == 0) {
-    sigprocmask(SIG_SETMASK, &Before, nullptr);
-    exit(Work(strDir));
-  }
-  int Status = 0;
-  const int Signal = WaitForChild(Child, Signals, &Status);
   std::error_code Ignored;
   std::filesystem::remove_all(strDir, Ignored);
-  sigprocmask(SIG_SETMASK, &Before, nullptr);
-  if (Signal != 0) {
-    raise(Signal);
+  _exit(0);
+}
+
+}  // namespace
+
+WorkDirectory::WorkDirectory() {
+  const char* szTmpDir = getenv("TMPDIR");
+  const std::string strTmpDir = szTmpDir == nullptr || *szTmpDir == '\0' ? "/tmp" : szTmpDir;
+  m_strName = std::filesystem::absolute(strTmpDir + "/tessel-preview.XXXXXX");
+  // The cleaner keeps all signals blocked. None may end this process before there is a cleaner.
+  sigset_t All;
+  sigset_t Before;
+  sigfillset(&All);
+  sigprocmask(SIG_SETMASK, &All, &Before);
+  if (mkdtemp(m_strName.data()) == nullptr) {
+    throw SystemFailure("cannot make a directory in " + strTmpDir);
   }
-  return WIFEXITED(Status) ? WEXITSTATUS(Status) : 2;
+  int rgPipe[2];
+  if (pipe(rgPipe) != 0 || (m_Cleaner = fork()) == -1) {
+    const Failure Reason = SystemFailure("cannot start a process");
+    rmdir(m_strName.c_str());
+    throw Reason;
+  }
+  if (m_Cleaner == 0) {
+    CleanUp(rgPipe, m_strName);
+  }
+  close(rgPipe[0]);
+  m_PipeFd = rgPipe[1];  // programs inherit it
+  sigprocmask(SIG_SETMASK, &Before, nullptr);
+}
+
+WorkDirectory::~WorkDirectory() {
+  close(m_PipeFd);
+  while (waitpid(m_Cleaner, nullptr, 0) == -1 && errno == EINTR) {
+  }
 }
 
 CommandResult RunCommand(const std::vector<std::string>& Arguments, int SyslogFd) {
@@ -151,8 +116,17 @@ CommandResult RunCommand(const std::vector<std::string>& Arguments, int SyslogFd
   }
   const fileops::Descriptor Read(rgPipe[0]);
   fileops::Descriptor Write(rgPipe[1]);
-  const pid_t Child = Fork();
+  signal(SIGCHLD, SIG_DFL);  // if it were ignored, there would be no status
+  const pid_t Parent = getpid();
+  const pid_t Child = fork();
+  if (Child == -1) {
+    throw SystemFailure("cannot start a process");
+  }
   if (Child == 0) {
+    prctl(PR_SET_PDEATHSIG, SIGKILL);
+    if (getppid() != Parent) {  // it has ended already
+      _exit(1);
+    }
     Become(Arguments, Write.Get());
   }
   Write.Close();

@@ -1,16 +1,28 @@
-// Processes: one that is cleaned up after, and other programs.
+// A directory that is cleaned up, and other programs.
 #pragma once
 
 #include <sys/types.h>
 
-#include <functional>
 #include <string>
 #include <vector>
 
-// Runs Work in a child process and returns its status. Gives Work the name of a new directory below
-// TMPDIR or /tmp. Removes the directory once the child and all its descendants have ended, even
-// after a crash. A signal that would end this process first ends the child. Throws Failure.
-int RunSupervised(const std::function<int(const std::string& strWorkDir)>& Work);
+// A new directory below TMPDIR or /tmp. Another process removes it once this object is gone or this
+// process has ended, even by SIGKILL, and all programs that it has started have ended, too. The
+// destructor waits for that. Throws Failure.
+class WorkDirectory {
+ public:
+  WorkDirectory();
+  ~WorkDirectory();
+  WorkDirectory(const WorkDirectory&) = delete;
+  WorkDirectory& operator=(const WorkDirectory&) = delete;
+
+  const std::string& Name() const { return m_strName; }  // absolute
+
+ private:
+  std::string m_strName;
+  pid_t m_Cleaner = -1;
+  int m_PipeFd = -1;
+};
 
 struct CommandResult {
   pid_t Pid = 0;
