@@ -222,8 +222,8 @@ void MakeChangeFile(const std::string& strFile, const std::string& strBefore,
   Db.Attach(strBefore, "before");
   Db.Attach(strAfter, "after");
   Db.Execute(std::string("BEGIN;") + TABLES + APPLICATION_ID + "; PRAGMA user_version = " + FORMAT);
-  Db.Run("INSERT INTO upgrade VALUES (?, ?, ?, ?, ?, ?, ?)", Info.strVersion, Info.strTool,
-         Info.strToolVersion, Info.strTime, Info.strDatabase, Info.Inode, Info.SchemaVersion);
+  Db.Run("INSERT INTO upgrade VALUES (?, ?, ?, datetime() || ' UTC', ?, ?, ?)", Info.strVersion,
+         Info.strTool, Info.strToolVersion, Info.strDatabase, Info.Inode, Info.SchemaVersion);
   Db.Execute(LIST_TABLES);
   Db.Execute(LIST_COLUMNS);
   Db.Execute(USE_ROWID + std::string("NULL"));
@@ -247,12 +247,12 @@ Upgrade ReadUpgrade(const Database& Changes) {
   if (Changes.Run("PRAGMA user_version") != FORMAT) {
     throw Failure(szFile + std::string(" has the format of another version"));
   }
-  Statement Read(Changes, "SELECT * FROM upgrade");
+  Statement Read(
+      Changes, "SELECT version, tool, tool_version, database, inode, schema_version FROM upgrade");
   if (!Read.Step()) {
     throw Failure(szFile + std::string(" is not complete"));
   }
-  return {Read.Text(0), Read.Text(1), Read.Text(2), Read.Text(3),
-          Read.Text(4), Read.Int(5),  Read.Int(6)};
+  return {Read.Text(0), Read.Text(1), Read.Text(2), Read.Text(3), Read.Int(4), Read.Int(5)};
 }
 
 std::vector<ChangedTable> ReadTables(const Database& Changes) {
@@ -274,16 +274,21 @@ std::string Numbered(const std::string& strPrefix, const std::vector<std::string
   return ForEach(Names, strPrefix + "{i}", ", ");
 }
 
-std::string SameKeys(const ChangedTable& Table, const std::string& strRow,
-                     const std::string& strKey) {
-  const std::string strSame = " AND " + strRow + ".{name} = " + strKey + " COLLATE ";
-  std::string strSql = "1";
+std::string ForEachKey(const ChangedTable& Table, const std::string& strPattern,
+                       const std::string& strBetween) {
+  std::string strSql;
   for (size_t Key = 0; Key < Table.Keys.size(); ++Key) {
-    const std::string strName = Quoted(Table.Keys[Key]);
-    strSql += Fill(strSame, {{"name", strName}, {"i", std::to_string(Key)}});
-    strSql += Quoted(Table.Collations[Key]);
+    strSql += (Key == 0 ? "" : strBetween) +
+              Fill(strPattern, {{"name", Quoted(Table.Keys[Key])},
+                                {"i", std::to_string(Key)},
+                                {"collation", Quoted(Table.Collations[Key])}});
   }
   return strSql;
+}
+
+std::string SameKeys(const ChangedTable& Table, const std::string& strRow,
+                     const std::string& strKey) {
+  return ForEachKey(Table, strRow + ".{name} = " + strKey + " COLLATE {collation}", " AND ");
 }
 
 std::string RowName(const ChangedTable& Table, const std::string& strKey) {

@@ -30,7 +30,6 @@ struct Upgrade {
   std::string strVersion;  // of the package that is replaced
   std::string strTool;     // the program
   std::string strToolVersion;
-  std::string strTime;
   std::string strDatabase;    // the recorder's database, without links
   int64_t Inode = 0;          // of that file
   int64_t SchemaVersion = 0;  // PRAGMA schema_version of that database; each VACUUM changes it
@@ -80,6 +79,10 @@ std::string Numbered(const std::string& strPrefix, const std::vector<std::string
 // Counts the foreign keys of rows in the database strSchema that lead nowhere, and adds them to the
 // table strList (child, row, parent, id, count).
 void ListDangling(const Database& Db, const std::string& strSchema, const std::string& strList);
+
+// Fills the pattern for each key of the table, as ForEach() does. {collation} is the key's.
+std::string ForEachKey(const ChangedTable& Table, const std::string& strPattern,
+                       const std::string& strBetween);
 
 // True if the row strRow of the table has these keys. strKey stands for each of them, as a pattern
 // of ForEach: "b.k{i}" for a row b of the change file, "t.{name}" for another row of the table.

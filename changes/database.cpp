@@ -37,6 +37,18 @@ Database::Database(const std::string& strName, int Flags) {
   Configure(m_pDb);
 }
 
+void Database::CopyTo(const Database& To) const {
+  sqlite3_backup* const pBackup = sqlite3_backup_init(To.Get(), "main", m_pDb, "main");
+  if (pBackup == nullptr) {
+    To.Throw(sqlite3_errcode(To.Get()));
+  }
+  sqlite3_backup_step(pBackup, -1);
+  const int Code = sqlite3_backup_finish(pBackup);
+  if (Code != SQLITE_OK) {
+    To.Throw(Code);
+  }
+}
+
 void Database::AttachReadOnly(const std::string& strFile, const std::string& strSchema) {
   std::string strUri = "file:";
   for (const char Char : strFile) {

@@ -32,8 +32,11 @@ class Database {
   Database(const Database&) = delete;
   Database& operator=(const Database&) = delete;
   sqlite3* Get() const { return m_pDb; }
-  // Only reads another database, and never locks it for writing.
+  // Only reads another database, and never locks it for writing: a transaction would need a journal
+  // over both, which a kill could leave behind.
   void AttachReadOnly(const std::string& strFile, const std::string& strSchema);
+  // Replaces the content of another database by this one's.
+  void CopyTo(const Database& To) const;
   void Attach(const std::string& strFile, const std::string& strSchema);
   void Execute(const std::string& strSql) const;
   // Runs one statement with values for its parameters. Returns the first column of its first row;

@@ -56,15 +56,7 @@ int64_t CopyDatabase(const std::string& strFrom, const std::string& strTo) {
     const std::string strVersion = From.Run("PRAGMA schema_version");
     const Database To(strTo, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE);
     To.Execute("PRAGMA synchronous = OFF");  // nobody needs the copy after a power cut
-    sqlite3_backup* const pBackup = sqlite3_backup_init(To.Get(), "main", From.Get(), "main");
-    if (pBackup == nullptr) {
-      To.Throw(sqlite3_errcode(To.Get()));
-    }
-    sqlite3_backup_step(pBackup, -1);
-    const int Code = sqlite3_backup_finish(pBackup);
-    if (Code != SQLITE_OK) {
-      To.Throw(Code);
-    }
+    From.CopyTo(To);
     return std::stoll(strVersion);
   } catch (const SqlFailure& Reason) {
     const bool blHeld = Reason.Code() == SQLITE_BUSY;

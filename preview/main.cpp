@@ -55,7 +55,6 @@ Upgrade CopyAppliance(const CommandLine& Options, const Tool& Tool) {
   Info.strDatabase = Options.strDatabase;
   Info.Inode = InodeOf(Options.strDatabase);
   Info.SchemaVersion = CopyDatabase(Options.strDatabase, Absolute(BEFORE_DATABASE));
-  Info.strTime = Database("", SQLITE_OPEN_READWRITE).Run("SELECT datetime() || ' UTC'");
   CopyDatabase(Absolute(BEFORE_DATABASE), Absolute(AFTER_DATABASE));
   fs::create_directory(BEFORE_CAPS);
   fs::create_directories(AFTER_CAPS_TARGET);

@@ -151,16 +151,6 @@ std::string FindCaps(const CommandLine& Options) {
 
 // --- The database ---
 
-void CopyTo(const Database& From, const Database& To) {
-  sqlite3_backup* pBackup = sqlite3_backup_init(To.Get(), "main", From.Get(), "main");
-  if (pBackup != nullptr) {
-    sqlite3_backup_step(pBackup, -1);
-  }
-  if (pBackup == nullptr || sqlite3_backup_finish(pBackup) != SQLITE_OK) {
-    To.Throw(sqlite3_errcode(To.Get()));
-  }
-}
-
 // Takes back all rows that can go back, and leaves the transaction open. A row that cannot, because
 // of what others have done since, shows only when all have: then they go back without it.
 std::vector<TableUndo> TakeBack(const Database& Db, const std::vector<ChangedTable>& Changed,
@@ -229,7 +219,7 @@ int Undo(const CommandLine& Options) {
     Database Db(strDatabase, SQLITE_OPEN_READWRITE);
     if (Options.blDryRun) {
       Database Copy("", SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE);  // SQLite removes it again
-      CopyTo(Db, Copy);
+      Db.CopyTo(Copy);
       Counts = UndoDatabase(&Copy, Db, strFile, Changes);
     } else {
       Db.Execute("PRAGMA synchronous = EXTRA");

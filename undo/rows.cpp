@@ -100,15 +100,6 @@ constexpr const char* ROWS = R"(
   SELECT count(*) FROM (SELECT {keys} FROM changes.before_{n} UNION
                         SELECT {keys} FROM changes.after_{n}))";
 
-std::string CollatedKeys(const ChangedTable& Table) {
-  std::string strSql;
-  for (size_t Key = 0; Key < Table.Keys.size(); ++Key) {
-    strSql += Key == 0 ? "" : ", ";
-    strSql += Quoted(Table.Keys[Key]) + " COLLATE " + Quoted(Table.Collations[Key]);
-  }
-  return strSql;
-}
-
 // In "camera", the same vendor and model make it the same row.
 std::string SameCamera(const ChangedTable& Table) {
   const auto Same = [&](int Column) {
@@ -154,7 +145,7 @@ WordMap MakeWords(const ChangedTable& Table) {
       {"same_camera", SameCamera(Table)},
       {"keys", Numbered("k", Table.Keys)},
       {"x_keys", Numbered("x.k", Table.Keys)},
-      {"collated_keys", CollatedKeys(Table)},
+      {"collated_keys", ForEachKey(Table, "{name} COLLATE {collation}", ", ")},
       {"t_is_x", SameKeys(Table, "t", "x.k{i}")},
       {"name", RowName(Table, "x.k{i}")},
       {"camera_name", CameraName(Table, "iif(x.kind = 'removed', b.c{i}, a.c{i})")},

@@ -37,7 +37,7 @@ Upgrade Describe(const std::string& strDatabase) {
   stat(strDatabase.c_str(), &Stat);
   const Database Db(strDatabase, SQLITE_OPEN_READWRITE);
   const int64_t SchemaVersion = std::stoll(Db.Run("PRAGMA schema_version"));
-  return {"400", "tool", "1", "now", strDatabase, static_cast<int64_t>(Stat.st_ino), SchemaVersion};
+  return {"400", "tool", "1", strDatabase, static_cast<int64_t>(Stat.st_ino), SchemaVersion};
 }
 
 }  // namespace
