@@ -91,9 +91,11 @@ WorkDirectory::WorkDirectory() {
   }
   int rgPipe[2];
   if (pipe(rgPipe) != 0 || (m_Cleaner = fork()) == -1) {
-    const Failure Reason = SystemFailure("cannot start a process");
-    rmdir(m_strName.c_str());
-    throw Reason;
+    {
+      const fileops::ErrnoKeeper Errno;
+      rmdir(m_strName.c_str());
+    }
+    throw SystemFailure("cannot start a process");
   }
   if (m_Cleaner == 0) {
     CleanUp(rgPipe, m_strName);
