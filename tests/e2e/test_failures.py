@@ -3,8 +3,10 @@
 import json
 import os
 import re
+import sqlite3
 import subprocess
 import time
+from contextlib import closing
 
 import pytest
 from conftest import PREVIEW, STRACE, TOOL, UNDO
@@ -137,6 +139,13 @@ def read_only(appliance):
         subprocess.check_call(mount)
     yield
     subprocess.check_call(["umount", appliance.caps])
+
+
+def test_a_database_that_is_held_has_no_preview(example, preview):
+    with closing(sqlite3.connect(example.database)) as recorder:
+        recorder.execute("BEGIN EXCLUSIVE")
+        (line,) = preview(0)
+    assert line.endswith("(another process has held it for five seconds)")
 
 
 def test_a_full_disk_has_one_record(example, syslog):

@@ -81,6 +81,27 @@ def test_shows_what_the_upgrade_then_changes(example, preview):
         f"{len(others)} other cells, {added} rows added, 0 rows removed, "
         f"{files} files changed, 0 actions failed\n"
     )
+    example.database.unlink()
+    example.load_example()
+    first, *_, last = text.splitlines()
+    assert preview("--summary", 0).splitlines() == [first, last]
+
+
+def test_relative_names_and_links_lead_to_what_they_say(
+    example, preview, kept
+):
+    (kept.parent / "EX-4310").symlink_to(example.caps / "EX-4310")
+    options = ["--caps", "kept", "--undo", "kept/from-0"]
+    database = "packages/Camveld/target/system.db"
+    text = preview(*options, database, 0, under=["env", "--chdir=/var"])
+    assert re.findall("^--- before/(.*)", text, re.M) == ["EX-4310"]
+    assert kept.exists()
+
+
+def test_the_summary_says_when_there_are_no_capability_files(example, preview):
+    shutil.rmtree(example.caps)
+    assert ", capability files not looked at, " in preview(2475)
+    assert json.loads(preview("--json", 2475))["files"] is None
 
 
 def escaped(match):
@@ -137,6 +158,8 @@ def test_json_says_the_same_as_the_text(example, preview, encoding):
     changes = [line_of(json.loads(change)) for change in changes]
     assert "\n".join(changes).splitlines() == lines
     assert "not compared: seen (view)" in lines
+    number = "0.30000000000000004 -> 1.4285714285714286e+299"
+    assert f"pairs 1, 'x' v: {number}" in lines
     summary = json.loads(summary)
     counted = [line for line in lines if re.match("camera .* -> ", line)]
     assert summary["camera_cells"] == len(counted)
@@ -180,10 +203,16 @@ def test_a_failed_action_has_its_name_and_the_reason(example, preview):
     assert output.endswith(", 1 actions failed\n")
 
 
+COLUMNS = ", ".join(f"c{number}" for number in range(480))
+WIDE = f"CREATE TABLE wide ({COLUMNS}{{}})"
+TOO_WIDE = "not compared: wide (more than 480 columns)\n"
 CHECKS = [
     # what is done to the database, version, status, what is said
     ("", 2475, 0, ""),
     ("", 2401, 3, ""),
+    ("DELETE FROM camera", 0, 3, ""),  # capability files change
+    (WIDE.format(""), 2475, 0, ""),
+    (WIDE.format(", more AS (c1)"), 2475, 2, TOO_WIDE),
     ("ALTER TABLE camera RENAME audio_format TO sound", 364, 255, ""),
     (
         "CREATE TABLE t (a COLLATE theirs PRIMARY KEY) WITHOUT ROWID",
@@ -287,11 +316,21 @@ def test_too_little_room_is_no_failure_of_the_upgrade(
     assert not os.listdir(kept.parent)
 
 
-def test_a_change_file_that_cannot_be_synced_is_not_kept(preview, kept):
-    error = ["-e", "inject=fsync:error=EIO", "-P", f"{kept}.part"]
+@pytest.mark.parametrize("synced", ["from-0.part", "."])
+def test_a_change_file_that_cannot_be_synced_is_not_kept(
+    preview, kept, synced
+):
+    error = ["-e", "inject=fsync:error=EIO", "-P", kept.parent / synced]
     said = preview("--undo", kept, 0, under=[*STRACE, "-f", *error], status=2)
     assert said == f"tessel-preview: cannot write {kept}: Input/output error\n"
     assert not os.listdir(kept.parent)
+
+
+@pytest.mark.parametrize("argument", ["0", "-h", "-V"])
+def test_output_that_is_lost_is_a_failure(preview, argument):
+    full = ["sh", "-c", 'exec "$@" >/dev/full', "sh"]
+    said = preview(argument, under=full, status=2)
+    assert said.startswith("tessel-preview: cannot write the output")
 
 
 MESSAGES = [
@@ -299,7 +338,7 @@ MESSAGES = [
     ("4294967296", "version 4294967296 is beyond 32 bits"),
     ("8.2.0-2401", "8.2.0-2401 (give the number after the last hyphen: 2401)"),
     ("{}/@camveld 0", "@camveld is not a regular file"),
-    ("{}/none 0", "none: No such file or directory"),
+    ("{}/no\x9bne 0", "no\\xc2\\x9bne: No such file or directory"),
     ("{}/text 0", "text: file is not a database"),
     ("--undo {}/text {}/system.db 0", "text exists already"),
     ("--undo {}/open/new {}/system.db 0", "others can write the directory"),
