@@ -5,10 +5,11 @@ import re
 import shutil
 import sqlite3
 import subprocess
+import time
 from contextlib import closing
 
 import pytest
-from conftest import SOURCE, UNDO, changed_rows, run
+from conftest import SOURCE, STRACE, UNDO, changed_rows, run
 from test_documents import options
 
 MAKE = "tests/makechanges"
@@ -164,7 +165,10 @@ def test_what_somebody_has_changed_is_left_and_named(example, upgraded, since):
 
 
 def test_an_interrupted_upgrade_goes_back(example, upgraded):
-    file = upgraded()
+    file = upgraded(name="100%41#?")
+    os.chmod(example.directory, 0o1777)  # only owners can replace files
+    vendor = example.rows_before["camera", 31]["vendor"]
+    example.sql(f"UPDATE camera SET vendor = '{vendor}' WHERE id = 31")
     example.sql("UPDATE camera SET resolution = 'QVGA' WHERE id = 1")
     example.sql("UPDATE note SET t = 'a' WHERE t = 'a!'")
     example.sql("DELETE FROM camdeviceoutput WHERE id = 12")
@@ -213,6 +217,13 @@ def test_an_index_of_words_stays_whole(example, upgraded):
 
 def test_a_changed_capability_file_is_left(example, upgraded):
     file = upgraded()
+    # A name that leads out of the directory is none of an upgrade.
+    outside = example.caps / "../EX-2200"
+    shutil.copy(example.caps / "EX-2200", outside)
+    with closing(sqlite3.connect(file)) as changes, changes:
+        changes.execute(
+            "UPDATE file SET name = '../EX-2200' WHERE name = 'EX-2200'"
+        )
     example.capability_file("EX-2100", "mine\n")
     (example.caps / "EX-4310").unlink()
     (example.caps / "EX-4310").mkdir()
@@ -221,6 +232,7 @@ def test_a_changed_capability_file_is_left(example, upgraded):
     assert changed.endswith("now 5 bytes (it has been changed since)")
     assert unreadable.startswith("left: file EX-4310: ")
     assert example.capability_files()["EX-2100"] == "mine\n"
+    assert outside.read_text() == example.capability_files()["EX-2200"]
 
 
 def test_a_file_that_cannot_be_written_is_named(example, upgraded):
@@ -242,16 +254,28 @@ def test_a_link_leads_to_the_database_that_sqlite_opens(
     # As text, link/.. would be tmp_path.
     (tmp_path / "a/system.db").symlink_to(example.database)
     database = tmp_path / "link/../system.db"
-    undo(example, "--caps", example.caps, file, database)
+    beside = tmp_path / "a/@camveld"
+    shutil.copytree(example.caps.parent, beside)
+    undo(example, file, database)
     assert changed_rows(example.rows_before, example.rows()) == []
+    assert example.capability_files() != example.files_before
+    undo(example, "--caps", file, file, database, status=2)
+    undo(example, "--caps", example.caps, file, database)
+    assert example.capability_files() == example.files_before
+    example.caps = beside / "@KICapInfo"
+    assert example.capability_files() == example.files_before
 
 
 def test_nobody_need_read_the_output(example, upgraded):
     file = upgraded()
+    # More lines than a buffer holds.
+    example.sql("UPDATE camera SET resolution = 'MINE'")
     command = example.command(UNDO, file)
-    with subprocess.Popen(command, stdout=subprocess.PIPE) as process:
+    pipes = {"stdout": subprocess.PIPE, "stderr": subprocess.PIPE}
+    with subprocess.Popen(command, **pipes) as process:
         process.stdout.close()
-    assert changed_rows(example.rows_before, example.rows()) == []
+        assert b"cannot write the output" in process.stderr.read()
+    assert example.capability_files() == example.files_before
 
 
 REFUSED = {
@@ -260,6 +284,9 @@ REFUSED = {
     "chmod 666 changes": "others can write /var/packages/Camveld/target/c",
     "echo text >system.db": "file is not a database",
     "cp system.db changes": "changes is not a change file",
+    "sqlite3 changes 'PRAGMA user_version = 2'": "format of another version",
+    "sqlite3 changes 'DELETE FROM upgrade'": "changes is not complete",
+    "chown 1 changes || chmod 666 changes": "others can write /var/packages/",
     "mkfifo a; mv a changes": "changes is not a regular file",
     "mv system.db a; cp a system.db": "system.db has been replaced since",
     "mv system.db /var/b; ln -s /var/b system.db": "the file belongs to",
@@ -284,12 +311,25 @@ def test_one_line_says_why_nothing_is_done(example, upgraded, wrong):
 
 def test_a_locked_database_is_not_touched(example, upgraded):
     file = upgraded()
+    begin = time.monotonic()
     with closing(sqlite3.connect(example.database)) as recorder:
         recorder.execute("BEGIN IMMEDIATE")
         output = undo(example, file, status=2)
+    assert time.monotonic() - begin > 4
     assert "another process has held it locked for five seconds" in output
+
+
+def test_rows_that_cannot_be_synced_do_not_go_back(example, upgraded):
+    file = upgraded()
+    rows = example.rows()
+    error = ["-e", "inject=/sync:error=EIO", "-P", example.database]
+    ended = run(*STRACE, *error, *example.command(UNDO, file))
+    assert ended.stdout.endswith("system.db: disk I/O error\n")
+    assert ended.returncode == 2
+    assert changed_rows(rows, example.rows()) == []
 
 
 def test_the_man_page_has_all_options(appliance):
     page = (SOURCE / "docs/tessel-undo.8").read_text().replace("\\-", "-")
-    assert options(undo(appliance, "--help")) == options(page)
+    assert options(undo(appliance, "-h")) == options(page)
+    assert undo(appliance, "-V").startswith("tessel-undo ")
