@@ -69,6 +69,8 @@ def test_saved_settings_come_back_and_show_tells_what_differs(kidbglog):
             "other categories: notice\n"
             "milliseconds: on"
         )
+    every = kidbglog("show --all")
+    assert every.count("category ") == 88 and "other" not in every
 
 
 def make_segment(size):
@@ -83,11 +85,16 @@ def test_a_full_table_loses_only_the_processes_that_are_gone(kidbglog):
     table += struct.pack("=ii", 4194305, 7)
     segment = LIBC.shmat(make_segment(2568), None, 0)
     ctypes.memmove(segment + 2052, table, len(table))
+    assert "process 4194305, gone: debug3" in kidbglog("show")
     assert kidbglog(f"pid {os.getpid()} info") == (
         "0 the table of processes was full: "
         "cleared process 4194305, which is gone"
     )
-    assert f"process {os.getpid()} " in kidbglog("show")
+    comm = Path("/proc/self/comm")
+    name = comm.read_text()
+    comm.write_text("a\x1bb")  # would control the terminal
+    assert f"process {os.getpid()} (a?b): info" in kidbglog("show")
+    comm.write_text(name)
     assert kidbglog(f"pid {os.getppid()} info").startswith(
         "1 kidbglog: the table of processes is full"
     )
@@ -123,6 +130,10 @@ def test_settings_that_cannot_be_used_are_named(kidbglog):
         refusal = f"1 kidbglog: {settings} is not a regular file"
         assert kidbglog(command) == refusal
     settings.unlink()
+    settings.symlink_to(settings)
+    refusal = f"1 kidbglog: created with the defaults, cannot read {settings}"
+    assert kidbglog("create").startswith(refusal)
+    settings.unlink()
     settings.parent.rmdir()
     refusal = f"1 kidbglog: cannot write {settings}: No such file"
     assert kidbglog("save").startswith(refusal)
@@ -154,6 +165,9 @@ MESSAGES = [
     (100, "show", "1 the segment has 100 bytes, not 2568"),
     (100, "create", "1 there is a segment of 100 bytes already, 2568 are"),
     (2568, "load", "1 nothing loaded from /var/packages/Camveld/etc/"),
+    (2568, "pid 1 clear", "1 process 1 has no threshold of its own"),
+    (2568, "pid 1x 7", "2 not a process id: '1x'"),
+    (2568, "ms maybe", "2 milliseconds are on or off, not 'maybe'"),
     (0, "set db,RTPS debug", "2 no category 'RTPS', the nearest is 'rtp'"),
     (0, "create --all", "2 wrong arguments for 'create', see"),
     (0, "'show --all'", "2 no command 'show --all', see"),
