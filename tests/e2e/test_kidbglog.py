@@ -135,6 +135,7 @@ def test_settings_that_cannot_be_used_are_named(kidbglog):
     assert kidbglog("create").startswith(refusal)
     settings.unlink()
     settings.parent.rmdir()
+    assert kidbglog("create") == "0"
     refusal = f"1 kidbglog: cannot write {settings}: No such file"
     assert kidbglog("save").startswith(refusal)
 
@@ -152,8 +153,9 @@ def test_only_a_process_gets_a_threshold(kidbglog):
     assert "process" not in kidbglog("show")
 
 
-@pytest.mark.parametrize("command", ["--help", "--version"])
-def test_output_that_is_lost_is_a_failure(appliance, command):
+@pytest.mark.parametrize("command", ["--help", "--version", "show"])
+def test_output_that_is_lost_is_a_failure(kidbglog, appliance, command):
+    kidbglog("create")
     words = appliance.command(KIDBGLOG, command)
     with open("/dev/full", "w") as full:
         assert subprocess.run(words, stdout=full).returncode == 1

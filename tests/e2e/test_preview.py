@@ -91,6 +91,7 @@ def test_relative_names_and_links_lead_to_what_they_say(
     example, preview, kept
 ):
     (kept.parent / "EX-4310").symlink_to(example.caps / "EX-4310")
+    (kept.parent / "from-0.part").touch()  # of a killed preview
     options = ["--caps", "kept", "--undo", "kept/from-0"]
     database = "packages/Camveld/target/system.db"
     text = preview(*options, database, 0, under=["env", "--chdir=/var"])
@@ -157,7 +158,8 @@ def test_json_says_the_same_as_the_text(example, preview, encoding):
     *changes, summary = preview("--json", 0, status=255).splitlines()
     changes = [line_of(json.loads(change)) for change in changes]
     assert "\n".join(changes).splitlines() == lines
-    assert "not compared: seen (view)" in lines
+    for shown in lines, preview("--summary", 0, status=255).splitlines():
+        assert "not compared: seen (view)" in shown
     number = "0.30000000000000004 -> 1.4285714285714286e+299"
     assert f"pairs 1, 'x' v: {number}" in lines
     summary = json.loads(summary)
@@ -206,6 +208,7 @@ def test_a_failed_action_has_its_name_and_the_reason(example, preview):
 COLUMNS = ", ".join(f"c{number}" for number in range(480))
 WIDE = f"CREATE TABLE wide ({COLUMNS}{{}})"
 TOO_WIDE = "not compared: wide (more than 480 columns)\n"
+NO_ROWID = "not compared: ids (columns hide every name of its rowid)\n"
 CHECKS = [
     # what is done to the database, version, status, what is said
     ("", 2475, 0, ""),
@@ -213,6 +216,7 @@ CHECKS = [
     ("DELETE FROM camera", 0, 3, ""),  # capability files change
     (WIDE.format(""), 2475, 0, ""),
     (WIDE.format(", more AS (c1)"), 2475, 2, TOO_WIDE),
+    ("CREATE TABLE ids (oid, rowid, _rowid_)", 2475, 2, NO_ROWID),
     ("ALTER TABLE camera RENAME audio_format TO sound", 364, 255, ""),
     (
         "CREATE TABLE t (a COLLATE theirs PRIMARY KEY) WITHOUT ROWID",
@@ -335,6 +339,7 @@ def test_output_that_is_lost_is_a_failure(preview, argument):
 
 MESSAGES = [
     ("--colour 0", "unrecognized option '--colour'"),
+    ("--json --check 0", "only one of --summary, --json, --list and --check"),
     ("4294967296", "version 4294967296 is beyond 32 bits"),
     ("8.2.0-2401", "8.2.0-2401 (give the number after the last hyphen: 2401)"),
     ("{}/@camveld 0", "@camveld is not a regular file"),
