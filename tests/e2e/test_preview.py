@@ -153,7 +153,7 @@ def test_json_says_the_same_as_the_text(example, preview, encoding):
     text = (SOURCE / "examples/appliance.sql").read_text()
     example.sql(f"PRAGMA encoding = '{encoding}'; {text} {AWKWARD}")
     example.sql("ALTER TABLE camera RENAME audio_format TO sound")
-    tool, *lines, _ = preview(0, status=255).splitlines()
+    tool, *lines, last = preview(0, status=255).splitlines()
     assert "tesselupgrader " in tool
     *changes, summary = preview("--json", 0, status=255).splitlines()
     changes = [line_of(json.loads(change)) for change in changes]
@@ -162,10 +162,8 @@ def test_json_says_the_same_as_the_text(example, preview, encoding):
         assert "not compared: seen (view)" in shown
     number = "0.30000000000000004 -> 1.4285714285714286e+299"
     assert f"pairs 1, 'x' v: {number}" in lines
-    summary = json.loads(summary)
-    counted = [line for line in lines if re.match("camera .* -> ", line)]
-    assert summary["camera_cells"] == len(counted)
-    assert (summary["actions_failed"], summary["status"]) == (1, 255)
+    numbers = map(int, re.findall(r"\d+", last))
+    assert list(json.loads(summary).values()) == ["summary", *numbers, 255]
 
 
 @pytest.mark.parametrize("mode", ["delete", "wal", "wal without shm"])
@@ -195,14 +193,6 @@ def test_a_crashed_database_is_seen_as_committed(
     shown = run(*example.command(PREVIEW, "--tool", tool, path, 0)).stdout
     change = "camera 3 (Eyseo TVIP62000) resolution: 'VGA' -> '640x480'"
     assert change in shown
-
-
-def test_a_failed_action_has_its_name_and_the_reason(example, preview):
-    example.sql("ALTER TABLE camera RENAME audio_format TO sound")
-    output = preview(364, status=255)
-    reason = "UpdateTrendNetAdoFmt: no such column: audio_format"
-    assert f"\nfailed: {reason}" in output
-    assert output.endswith(", 1 actions failed\n")
 
 
 COLUMNS = ", ".join(f"c{number}" for number in range(480))
