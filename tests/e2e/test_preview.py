@@ -241,6 +241,14 @@ def other_tool(tmp_path, commands):
     return tool
 
 
+def test_an_action_with_two_reasons_counts_once(preview, tmp_path):
+    record = "logger -p user.err -t tesselupgrader Upgrade: EX"
+    tool = other_tool(tmp_path, f"{record}-1: no; {record}-2: no; exit 255")
+    text = preview(0, tool=tool, status=255)
+    assert "failed: Upgrade: EX-1: no\nfailed: Upgrade: EX-2: no\n" in text
+    assert text.endswith(", 1 actions failed\n")
+
+
 def test_a_signal_leaves_nothing_behind(preview, tmp_path):
     tool = other_tool(tmp_path, "exec sleep 68.5")
     under = "timeout --preserve-status --foreground 1".split()
