@@ -61,6 +61,7 @@ def test_saved_settings_come_back_and_show_tells_what_differs(kidbglog):
         assert kidbglog(command) == "0"
     for back in "load", "create":
         kidbglog("set all alarm")
+        assert kidbglog("show").count("): alarm") == 88
         kidbglog("ms off")
         assert kidbglog(back) == "0"
         assert kidbglog("") == (
@@ -105,12 +106,15 @@ def test_changes_wait_for_each_other_and_show_for_none(kidbglog, appliance):
     directory = os.open("/var/packages/Camveld", os.O_RDONLY)
     fcntl.flock(directory, fcntl.LOCK_SH)
     no_time_passes = [*STRACE, "-e", "inject=/nanosleep:retval=0"]
+    refusal = "kidbglog: another command has held the lock on /var/"
+    changes = "set db 3", "pid 1 clear", "ms on", "create", "load", "save"
     for command, expected in [
         ("show", "all categories: notice"),
-        ("ms on", "kidbglog: another command has held the lock on /var/"),
+        *((change, refusal) for change in changes),
     ]:
         words = appliance.command(KIDBGLOG, *command.split())
-        assert run(*no_time_passes, *words).stdout.startswith(expected)
+        said = run(*no_time_passes, *words).stdout
+        assert said.startswith(expected), f"{command}: {said}"
     os.close(directory)
 
 

@@ -17,7 +17,8 @@ from test_migrations import tables
 AWKWARD = r"""
     CREATE TABLE "o'd ""tab"" 1" (rowid, "a b" UNIQUE, d);
     INSERT INTO "o'd ""tab"" 1" (rowid, "a b", d) VALUES
-      (1, x'00ff', CAST(x'ff41' AS TEXT)), (NULL, 1.5, 'x'),
+      (1, x'00ff', CAST(x'ff41' AS TEXT)),
+      (NULL, 1.5, CAST(x'e08080' AS TEXT)),
       (7, CAST(x'410042' AS TEXT), '');
     CREATE TABLE pairs (a COLLATE NOCASE, b, v, PRIMARY KEY (b DESC, a))
       WITHOUT ROWID;
