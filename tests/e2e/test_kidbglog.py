@@ -106,7 +106,8 @@ def test_changes_wait_for_each_other_and_show_for_none(kidbglog, appliance):
     directory = os.open("/var/packages/Camveld", os.O_RDONLY)
     fcntl.flock(directory, fcntl.LOCK_SH)
     no_time_passes = [*STRACE, "-e", "inject=/nanosleep:retval=0"]
-    refusal = "kidbglog: another command has held the lock on /var/"
+    held = "another command has held the lock on /var/packages/Camveld"
+    refusal = f"kidbglog: {held} for 10 seconds"
     changes = "set db 3", "pid 1 clear", "ms on", "create", "load", "save"
     for command, expected in [
         ("show", "all categories: notice"),
