@@ -43,7 +43,7 @@ UPGRADE = """
     UPDATE word SET n = 1.0 WHERE id = 2;
     DELETE FROM relay;
     DELETE FROM tag WHERE t = 'y';
-    UPDATE tag SET number = 3 WHERE t = 'x'"""
+    UPDATE tag SET t = 'X', number = 3 WHERE t = 'x'"""
 
 
 @pytest.fixture
@@ -129,7 +129,7 @@ LEFT = {
         "it refers to a row of camdeviceoutput that is gone",
     ),
     "INSERT INTO tagged VALUES (3)": (
-        "tag 'x' changed: before number=1; after number=3; now number=3",
+        "tag 'x' changed: before t='x', number=1; after t='X', number=3; now",
         "a row of tagged refers to it",
     ),
     "UPDATE camera SET fov = 'rear side' WHERE id = 6;"
@@ -157,7 +157,8 @@ LEFT = {
 
 
 def names(before, after):
-    return {" ".join(line.split()[:2]) for line in changed_rows(before, after)}
+    lines = changed_rows(before, after)
+    return {" ".join(line.lower().split()[:2]) for line in lines}
 
 
 @pytest.mark.parametrize("since", LEFT)
