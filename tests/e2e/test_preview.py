@@ -208,8 +208,8 @@ CHECKS = [
     ("", 2475, 0, ""),
     ("", 2401, 3, ""),
     ("DELETE FROM camera", 0, 3, ""),  # capability files change
-    (WIDE.format(""), 2475, 0, ""),
-    (WIDE.format(", more AS (c1)"), 2475, 2, TOO_WIDE),
+    (WIDE.format(", more AS (c1)"), 2475, 0, ""),
+    (WIDE.format(", more"), 2475, 2, TOO_WIDE),
     ("CREATE TABLE ids (oid, rowid, _rowid_)", 2475, 2, NO_ROWID),
     (THEIRS, 2401, 2, NO_ORDER),
     (f"{THEIRS}; ALTER TABLE camera DROP audio_format", 364, 255, NO_ORDER),

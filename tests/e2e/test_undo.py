@@ -158,7 +158,8 @@ LEFT = {
 
 def names(before, after):
     lines = changed_rows(before, after)
-    return {" ".join(line.lower().split()[:2]) for line in lines}
+    words = [line.lower().replace("'", "").split() for line in lines]
+    return {f"{table} {key}" for table, key, *_ in words}
 
 
 @pytest.mark.parametrize("since", LEFT)
