@@ -249,9 +249,10 @@ def test_an_action_with_two_reasons_counts_once(preview, tmp_path):
 
 
 def test_a_signal_leaves_nothing_behind(preview, tmp_path):
-    sleep = f"sleep {1000 + os.getpid()}"  # unlike that of another run
+    sleep = f"sleep 60.{os.getpid()}"  # unlike that of another run
     tool = other_tool(tmp_path, f"exec {sleep}")
-    under = "timeout --preserve-status --foreground 1".split()
+    # It does not wait for the tool to end.
+    under = "timeout --preserve-status --foreground --kill-after=20 1".split()
     preview(0, under=under, status=143, tool=tool)
     assert run("pgrep", "-xf", sleep).stdout == ""
 
