@@ -28,7 +28,7 @@ AWKWARD = r"""
     CREATE TRIGGER t AFTER UPDATE ON camera WHEN new.vendor = 'SIEMENS' BEGIN
       UPDATE "o'd ""tab"" 1" SET rowid = x'01', d = d || CAST(x'c3' AS TEXT);
       UPDATE "o'd ""tab"" 1" SET "a b" = 'it''s \' WHERE "a b" = 1.5;
-      UPDATE pairs SET v = 1e300 / 7 WHERE b = 1;
+      UPDATE pairs SET v = 1.0 / 3 WHERE b = 1;
       DELETE FROM pairs WHERE b = 2;
       INSERT INTO added (v) VALUES (NULL), (-9223372036854775807 - 1), (9e999),
         (1e-300 / 3), (char(0, 13, 10, 34, 39, 92, 233)), (x''), (x'00ff');
@@ -162,7 +162,7 @@ def test_json_says_the_same_as_the_text(example, preview, encoding):
     for shown in lines, preview("--summary", 0, status=255).splitlines():
         others = [line for line in shown if line.startswith("not compared")]
         assert others == ["not compared: seen (view)"]
-    number = "0.30000000000000004 -> 1.4285714285714286e+299"
+    number = "0.30000000000000004 -> 0.3333333333333333"
     assert f"pairs 1, 'x' v: {number}" in lines
     numbers = map(int, re.findall(r"\d+", last))
     assert list(json.loads(summary).values()) == ["summary", *numbers, 255]
