@@ -98,7 +98,7 @@ def fresh_database():
 def make_files(count, text, directory=FILES):
     """Makes capability files of some 40 lines, with the text in the middle."""
     shutil.rmtree(directory, ignore_errors=True)
-    directory.mkdir()
+    directory.mkdir(parents=True)
     lines = [f"resolution_{line} = 1920x1080,1280x720\n" for line in range(18)]
     for number in range(count):
         file = directory / f"{number:05}"
