@@ -7,6 +7,10 @@
 
 namespace {
 
+// The last one is SQLITE_RESULT_SUBTYPE of SQLite 3.45, which demands it of value_json(). Older
+// versions ignore it.
+constexpr int FUNCTION_FLAGS = SQLITE_UTF8 | SQLITE_DETERMINISTIC | 0x1000000;
+
 constexpr unsigned int JSON_SUBTYPE = 'J';  // tells SQLite's JSON functions that a text is JSON
 
 std::string Hex(const std::string& strBytes) {
@@ -157,12 +161,10 @@ std::string Name(const std::string& strText) {
 }
 
 void AddPrintFunctions(const Database& Db) {
-  // SQLITE_RESULT_SUBTYPE of SQLite 3.45, which demands it of value_json(). Others ignore it.
-  constexpr int RESULT_SUBTYPE = 0x1000000;
-  constexpr int FLAGS = SQLITE_UTF8 | SQLITE_DETERMINISTIC | RESULT_SUBTYPE;
   for (const auto& [szName, pFunction] :
        {std::pair("shown", &ReturnText<Shown>), std::pair("plain", &ReturnText<Plain>),
         std::pair("shown_name", &ReturnText<ShownName>), std::pair("value_json", &ValueJson)}) {
-    sqlite3_create_function(Db.Get(), szName, 1, FLAGS, nullptr, pFunction, nullptr, nullptr);
+    sqlite3_create_function(Db.Get(), szName, 1, FUNCTION_FLAGS, nullptr, pFunction, nullptr,
+                            nullptr);
   }
 }

@@ -214,7 +214,7 @@ int ZAMOCPatience::Lock(int Fd) {
 }
 
 std::string ZAMOCChangeText(const std::string& strFile, ZAMOCPatience* pPatience,
-                            const ZAMOCTextChange& Change, bool* pblStayedLocked) {
+                            const ZAMOCTextChange& Change, bool* pStayedLocked) {
   const fileops::NoCancel Guard;  // a cancelled call would lose a descriptor or leave a file
   std::string strReal = strFile;
   if (strReal.find('/') == std::string::npos || IsLink(strFile)) {
@@ -231,8 +231,8 @@ std::string ZAMOCChangeText(const std::string& strFile, ZAMOCPatience* pPatience
     return Reason("open of the directory");
   }
   // Concurrent changes must not undo each other.
-  *pblStayedLocked = pPatience->Lock(Dir.Get()) != 0;
-  if (*pblStayedLocked) {
+  *pStayedLocked = pPatience->Lock(Dir.Get()) != 0;
+  if (*pStayedLocked) {
     return Reason("lock of the directory");
   }
   return ReplaceFile(strReal, strDir, Dir.Get(), Change);

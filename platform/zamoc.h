@@ -44,9 +44,9 @@ using ZAMOCTextChange = std::function<std::string(const std::string& strText)>;
 // Replaces the text of strFile by what Change makes of it, under the lock. Leaves the file alone if
 // that is the same. Returns an empty string, or the reason for a failure; the file is then
 // unchanged, unless only the sync of the directory after the replacement failed. Sets
-// *pblStayedLocked to true if the directory stayed locked.
+// *pStayedLocked to true if the directory stayed locked.
 std::string ZAMOCChangeText(const std::string& strFile, ZAMOCPatience* pPatience,
-                            const ZAMOCTextChange& Change, bool* pblStayedLocked);
+                            const ZAMOCTextChange& Change, bool* pStayedLocked);
 
 // One capability file: its keys when the object was made, and the changes to make. Must not be used
 // by two threads at a time.

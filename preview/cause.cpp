@@ -28,17 +28,19 @@ bool FailsWithout(const Database& Db, const std::string& strSqlCmd, const std::s
 // Deletes half of the rows, again and again. Returns the rowid of the last one; "" if the text does
 // not fail with either half.
 std::string LastRow(const Database& Db, const std::string& strSqlCmd, const std::string& strTable) {
-  const std::string strFrom = " FROM " + strTable;
-  while (Db.Run("SELECT count(*)" + strFrom) != "1") {
-    const std::string strMiddle =
-        Db.Run("SELECT rowid" + strFrom + " ORDER BY rowid LIMIT 1 OFFSET (SELECT count(*) / 2" +
-               strFrom + ")");
-    if (!FailsWithout(Db, strSqlCmd, strTable + " WHERE rowid >= " + strMiddle) &&
-        !FailsWithout(Db, strSqlCmd, strTable + " WHERE rowid < " + strMiddle)) {
+  WordMap Words = {{"table", strTable}};
+  const std::string strCount = Fill("SELECT count(*) FROM {table}", Words);
+  const std::string strMiddleRow = Fill(
+      "SELECT rowid FROM {table} ORDER BY rowid LIMIT 1 OFFSET (SELECT count(*) / 2 FROM {table})",
+      Words);
+  while (Db.Run(strCount) != "1") {
+    Words["middle"] = Db.Run(strMiddleRow);
+    if (!FailsWithout(Db, strSqlCmd, Fill("{table} WHERE rowid >= {middle}", Words)) &&
+        !FailsWithout(Db, strSqlCmd, Fill("{table} WHERE rowid < {middle}", Words))) {
       return "";
     }
   }
-  return Db.Run("SELECT rowid" + strFrom);
+  return Db.Run(Fill("SELECT rowid FROM {table}", Words));
 }
 
 }  // namespace

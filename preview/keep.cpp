@@ -15,6 +15,8 @@ namespace fs = std::filesystem;
 
 namespace {
 
+constexpr size_t CHUNK_BYTES = size_t{1} << 20;
+
 int OpenDirectory(const std::string& strDir) {
   const int Fd = open(strDir.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
   if (Fd == -1) {
@@ -26,7 +28,6 @@ int OpenDirectory(const std::string& strDir) {
 
 // Returns 0, or -1 with errno.
 int CopyContent(int From, int To) {
-  constexpr size_t CHUNK_BYTES = size_t{1} << 20;
   ssize_t Len;
   do {
     Len = sendfile(To, From, nullptr, CHUNK_BYTES);
@@ -66,9 +67,9 @@ void KeptFile::Keep(const std::string& strFrom) {
       renameat(m_Dir.Get(), strPart.c_str(), m_Dir.Get(), m_strName.c_str()) != 0 ||
       // EINVAL: this file system cannot sync a directory.
       (fsync(m_Dir.Get()) != 0 && errno != EINVAL)) {
-    const Failure Reason = SystemFailure("cannot write " + m_strFile);
+    const std::string strReason = SystemFailure("cannot write " + m_strFile).what();
     unlinkat(m_Dir.Get(), strPart.c_str(), 0);
     unlinkat(m_Dir.Get(), m_strName.c_str(), 0);
-    throw Reason;
+    throw Failure(strReason);
   }
 }

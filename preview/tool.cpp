@@ -8,9 +8,11 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <initializer_list>
+#include <string_view>
 
 #include "copy.h"
 #include "failure.h"
@@ -56,9 +58,10 @@ void AddFailure(const std::string& strRecord, std::vector<FailedAction>* pFailur
   FailedAction Failed;
   Failed.strName = szName;
   Failed.strReason = strRecord.substr(static_cast<size_t>(Reason));
-  const size_t Code = Failed.strReason.rfind(" (extended code ");
+  constexpr std::string_view Mark = " (extended code ";
+  const size_t Code = Failed.strReason.rfind(Mark);
   if (Code != std::string::npos) {
-    sscanf(&Failed.strReason[Code], " (extended code %d)", &Failed.Code);
+    Failed.Code = static_cast<int>(strtol(&Failed.strReason[Code + Mark.size()], nullptr, 10));
     Failed.strReason.erase(Code);
   }
   pFailures->push_back(Failed);
