@@ -16,6 +16,7 @@ from subprocess import PIPE, STDOUT
 import pytest
 
 SOURCE = Path(__file__).resolve().parents[2]
+EXPECTED = SOURCE / "tests/expected"
 TOOL = "sbin/tesselupgrader"
 PREVIEW = "sbin/tessel-preview"
 UNDO = "sbin/tessel-undo"
@@ -149,6 +150,16 @@ class Appliance:
         for path, content in saved.items():
             path.write_bytes(content)
 
+    def state(self):
+        """Returns rows and capability files, for must_be_as()."""
+        return self.rows(), self.capability_files()
+
+    def must_be_as(self, state):
+        changes = changed_rows(state[0], self.rows())
+        diffs = unified_diffs(state[1], self.capability_files())
+        if changes or diffs:
+            complain("differs from before", changes + diffs.splitlines())
+
     def upgrade(self, *arguments, under=()):
         """Runs the tool, under a command such as strace if there is one."""
         rows, files = self.rows(), self.capability_files()
@@ -166,12 +177,10 @@ class Appliance:
         """Returns the command line of a program of the build tree."""
         return [*self.emulator, self.build / program, *map(str, arguments)]
 
-    def script(self, path, program, *options):
+    def script(self, path, program):
         """Writes a script that runs a program, in an emulator if need be."""
-        command = shlex.join(map(str, self.command(program, *options)))
-        path.write_text(f'#!/bin/sh\nexec {command} "$@"\n')
-        path.chmod(0o755)
-        return path
+        command = shlex.join(map(str, self.command(program)))
+        return write_script(path, f'exec {command} "$@"')
 
     def log(self):
         """Returns the log without time, process and line number."""
@@ -213,6 +222,19 @@ class Appliance:
         """Returns the text of each file by its name."""
         files = filter(Path.is_file, self.caps.glob("*"))
         return {path.name: read(path) for path in files}
+
+
+def write_script(path, commands):
+    """Writes a shell script. Returns its path."""
+    path.write_text(f"#!/bin/sh\n{commands}\n")
+    path.chmod(0o755)
+    return path
+
+
+def other_tool(path, commands):
+    """Writes a tool that runs commands in the place of an upgrade."""
+    # A preview calls it without an argument, for its name and version.
+    return write_script(path, f"[ $# = 1 ] || exit 1\nset -e\n{commands}")
 
 
 def run(*command, cwd=None):
@@ -304,6 +326,49 @@ def example(appliance):
     """The appliance of examples/: old cameras and some capability files."""
     appliance.load_example()
     return appliance
+
+
+@pytest.fixture
+def preview(example, tmp_path):
+    """Runs the preview, which must leave nothing and change nothing."""
+    own_tool = example.script(tmp_path / "tool", TOOL)
+    temporary = tmp_path / "tmp"
+    temporary.mkdir()
+    example.directory.chmod(0o755)  # others cannot replace a change file
+
+    def run_preview(*arguments, under=(), status=0, tool=own_tool):
+        before = example.state()
+        command = example.command(PREVIEW, "--tool", tool, *arguments)
+        ended = run("env", f"TMPDIR={temporary}", *under, *command)
+        assert ended.returncode == status, ended.stdout
+        example.must_be_as(before)
+        assert not os.listdir(temporary)
+        return ended.stdout
+
+    return run_preview
+
+
+@pytest.fixture
+def accepts(request):
+    """Compares lines with those of an expected file, or accepts them."""
+
+    def compare(name, title, lines):
+        path = EXPECTED / name
+        if request.config.getoption("accept"):
+            text = "".join(line + "\n" for line in lines)
+            request.config.stash[ACCEPTED][path] = text
+            return
+        text = path.read_text() if path.exists() else ""
+        expected = text.splitlines()
+        missing = [f"- {line}" for line in expected if line not in lines]
+        new = [f"+ {line}" for line in lines if line not in expected]
+        title = f"{TO_ACCEPT}{title} (tests/expected/{name})"
+        if missing or new:
+            complain(title, missing + new)
+        if lines != expected:
+            complain(f"{title}: only the order of lines")
+
+    return compare
 
 
 @pytest.fixture

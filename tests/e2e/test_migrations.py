@@ -11,10 +11,9 @@ from dataclasses import dataclass
 from pathlib import Path
 
 import pytest
-from conftest import ACCEPTED, SOURCE, STRACE, TO_ACCEPT
+from conftest import EXPECTED, SOURCE, STRACE
 from conftest import complain, new_appliance, row_name, run
 
-EXPECTED = SOURCE / "tests/expected"
 # A row of an action table: threshold and name.
 TABLE_ROW = re.compile(r"^ *\{(\d+), (?!nullptr)(\w+)\},$", re.M)
 TRACE = Path("/var/trace")
@@ -135,28 +134,6 @@ def transactions(request):
     with new_appliance(request.config) as example:
         example.load_example()
         return find_transactions(example)
-
-
-@pytest.fixture
-def accepts(request):
-    """Compares lines with those of an expected file, or accepts them."""
-
-    def compare(name, title, lines):
-        path = EXPECTED / name
-        if request.config.getoption("accept"):
-            text = "".join(line + "\n" for line in lines)
-            request.config.stash[ACCEPTED][path] = text
-            return
-        expected = path.read_text().splitlines()
-        missing = [f"- {line}" for line in expected if line not in lines]
-        new = [f"+ {line}" for line in lines if line not in expected]
-        title = f"{TO_ACCEPT}{title} (tests/expected/{name})"
-        if missing or new:
-            complain(title, missing + new)
-        if lines != expected:
-            complain(f"{title}: only the order of lines")
-
-    return compare
 
 
 @with_transactions

@@ -10,10 +10,11 @@ from contextlib import closing
 from pathlib import Path
 
 import pytest
-from conftest import PREVIEW, SOURCE, STRACE, TOOL, run
+from conftest import PREVIEW, SOURCE, STRACE, TOOL, other_tool, run
 from test_migrations import tables
 
-# Names and values of all kinds, which a trigger changes in turn.
+# Names and values of all kinds, and what changes them.
+# The text d8c3 is invalid in each encoding.
 AWKWARD = r"""
     CREATE TABLE "o'd ""tab"" 1" (rowid, "a b" UNIQUE, d);
     INSERT INTO "o'd ""tab"" 1" (rowid, "a b", d) VALUES
@@ -24,34 +25,24 @@ AWKWARD = r"""
       WITHOUT ROWID;
     INSERT INTO pairs VALUES ('x', 1, 0.1 + 0.2), ('y', 1, NULL), ('Z', 2, 3);
     CREATE TABLE added (id INTEGER PRIMARY KEY AUTOINCREMENT, v);
-    CREATE VIEW seen AS SELECT 1;
-    CREATE TRIGGER t AFTER UPDATE ON camera WHEN new.vendor = 'SIEMENS' BEGIN
-      UPDATE "o'd ""tab"" 1" SET rowid = x'01', d = d || CAST(x'c3' AS TEXT);
-      UPDATE "o'd ""tab"" 1" SET "a b" = 'it''s \' WHERE "a b" = 1.5;
-      UPDATE pairs SET v = 1.0 / 3 WHERE b = 1;
-      DELETE FROM pairs WHERE b = 2;
-      INSERT INTO added (v) VALUES (NULL), (-9223372036854775807 - 1), (9e999),
-        (1e-300 / 3), (char(0, 13, 10, 34, 39, 92, 233)), (x''), (x'00ff');
-    END;"""
-
-
-@pytest.fixture
-def preview(example, tmp_path):
-    """Runs the program, which must leave nothing and change nothing."""
-    tool = example.script(tmp_path / "tool", TOOL)
-    temporary = tmp_path / "tmp"
-    temporary.mkdir()
-
-    def run_preview(*arguments, under=(), status=0, tool=tool):
-        before = everything(example)
-        command = example.command(PREVIEW, "--tool", tool, *arguments)
-        ended = run("env", f"TMPDIR={temporary}", *under, *command)
-        assert ended.returncode == status, ended.stdout
-        assert everything(example) == before
-        assert not os.listdir(temporary)
-        return ended.stdout
-
-    return run_preview
+    CREATE VIEW seen AS SELECT 1;"""
+CHANGES = r"""
+    UPDATE camera SET resolution = 'it''s \', motion_area = x'00' WHERE id = 3;
+    UPDATE "o'd ""tab"" 1" SET rowid = x'01', d = d || CAST(x'd8c3' AS TEXT);
+    UPDATE "o'd ""tab"" 1" SET "a b" = 'it''s \' WHERE "a b" = 1.5;
+    UPDATE pairs SET v = 1.0 / 3 WHERE b = 1;
+    DELETE FROM pairs WHERE b = 2;
+    INSERT INTO added (v) VALUES (NULL), (-9223372036854775807 - 1), (9e999),
+      (1e-300 / 3), (char(0, 13, 10, 34, 39, 92, 233)), (x''), (x'00ff');"""
+# A tool that makes these changes, and two failures of one action.
+CHANGING_TOOL = """
+    cd /var/packages/Camveld/target
+    sqlite3 system.db <changes.sql
+    printf 'added=1' >>@camveld/@KICapInfo/EX-2100
+    for name in EX-1 EX-2; do
+      logger -p user.err -t tesselupgrader "Upgrade: $name: it's full"
+    done
+    exit 255"""
 
 
 @pytest.fixture
@@ -62,30 +53,36 @@ def kept():
     return directory / "from-0"
 
 
-def everything(example):
-    return example.rows(), example.capability_files()
-
-
 def test_shows_what_the_upgrade_then_changes(example, preview):
-    text = preview(0)
-    upgrade = example.upgrade(0)
-    shown = re.findall("^.*: .* -> .*|^.* added: .*", text, re.M)
-    assert sorted(shown) == sorted(upgrade.changes)
-    cells = [line for line in upgrade.changes if " -> " in line]
-    added = len(upgrade.changes) - len(cells)
-    others = [line for line in cells if not line.startswith("camera ")]
-    count = len(cells) - len(others)
-    cameras = {line.split()[1] for line in cells if line not in others}
-    files = upgrade.diffs.count("--- ")
-    assert text.endswith(
-        f"\n{upgrade.diffs}{count} cells in {len(cameras)} cameras, "
-        f"{len(others)} other cells, {added} rows added, 0 rows removed, "
-        f"{files} files changed, 0 actions failed\n"
-    )
+    first, *lines, last = preview(0).splitlines()
+    assert preview("--summary", 0).splitlines() == [first, last]
     example.database.unlink()
     example.load_example()
-    first, *_, last = text.splitlines()
-    assert preview("--summary", 0).splitlines() == [first, last]
+    upgrade = example.upgrade(0)
+    diffs = upgrade.diffs.splitlines()
+    assert lines[-len(diffs) :] == diffs
+    assert sorted(lines[: -len(diffs)]) == sorted(upgrade.changes)
+
+
+@pytest.mark.parametrize("encoding", ["UTF-8", "UTF-16be"])
+def test_awkward_names_and_values_are_shown_as_expected(
+    example, preview, tmp_path, accepts, encoding
+):
+    example.database.unlink()
+    text = (SOURCE / "examples/appliance.sql").read_text()
+    example.sql(f"PRAGMA encoding = '{encoding}'; {text} {AWKWARD}")
+    changes = tmp_path / "changes.sql"
+    changes.write_text(CHANGES)
+    tool = other_tool(
+        tmp_path / "tool2", CHANGING_TOOL.replace("changes.sql", str(changes))
+    )
+    lines = []
+    for mode in "", "--json", "--summary":
+        shown = preview(*mode.split(), 0, tool=tool, status=255).splitlines()
+        lines.append(f"tessel-preview {mode}")
+        lines += [line for line in shown if str(tool) not in line]
+    title = "the preview prints other lines"
+    accepts(f"preview-{encoding.lower()}.txt", title, lines)
 
 
 def test_relative_names_and_links_lead_to_what_they_say(
@@ -104,68 +101,6 @@ def test_the_summary_says_when_there_are_no_capability_files(example, preview):
     shutil.rmtree(example.caps)
     assert ", capability files not looked at, " in preview(2475)
     assert json.loads(preview("--json", 2475))["files"] is None
-
-
-def escaped(match):
-    return f"\\x{ord(match[0]):02x}"
-
-
-def shown(value):
-    """A value of the JSON output as the text shows it."""
-    match value:
-        case None:
-            return "NULL"
-        case {"blob": digits}:
-            return f"x'{digits}'"
-        case {"real": name}:
-            return name.lower()
-        case str() | {"text": _}:
-            is_text = isinstance(value, str)
-            raw = value.encode() if is_text else bytes.fromhex(value["text"])
-            raw = re.sub(rb"(['\\])", rb"\\\1", raw).decode("latin-1")
-            return "'" + re.sub("[^ -~]", escaped, raw) + "'"
-        case _:
-            return str(value)
-
-
-def line_of(change):
-    """An object of the JSON output as a line of the text."""
-    match change:
-        case {"change": "not compared"}:
-            return "not compared: {table} ({reason})".format(**change)
-        case {"change": "file"}:
-            return change["diff"].removesuffix("\n")
-        case {"change": "failed"}:
-            return "failed: {action}: {reason}".format(**change)
-    row = change["row"] if isinstance(change["row"], list) else [change["row"]]
-    start = f"{change['table']} {', '.join(map(shown, row))}"
-    if change["change"] != "cell":
-        cells = [f"{k}={shown(v)}" for k, v in change["values"].items()]
-        return f"{start} {change['change']}: {', '.join(cells)}"
-    if change["table"] == "camera":
-        start += f" ({change['vendor']} {change['model']})"
-    cells = shown(change["before"]), shown(change["after"])
-    return f"{start} {change['column']}: {' -> '.join(cells)}"
-
-
-@pytest.mark.parametrize("encoding", ["UTF-8", "UTF-16be"])
-def test_json_says_the_same_as_the_text(example, preview, encoding):
-    example.database.unlink()
-    text = (SOURCE / "examples/appliance.sql").read_text()
-    example.sql(f"PRAGMA encoding = '{encoding}'; {text} {AWKWARD}")
-    example.sql("ALTER TABLE camera RENAME audio_format TO sound")
-    tool, *lines, last = preview(0, status=255).splitlines()
-    assert "tesselupgrader " in tool
-    *changes, summary = preview("--json", 0, status=255).splitlines()
-    changes = [line_of(json.loads(change)) for change in changes]
-    assert "\n".join(changes).splitlines() == lines
-    for shown in lines, preview("--summary", 0, status=255).splitlines():
-        others = [line for line in shown if line.startswith("not compared")]
-        assert others == ["not compared: seen (view)"]
-    number = "0.30000000000000004 -> 0.3333333333333333"
-    assert f"pairs 1, 'x' v: {number}" in lines
-    numbers = map(int, re.findall(r"\d+", last))
-    assert list(json.loads(summary).values()) == ["summary", *numbers, 255]
 
 
 @pytest.mark.parametrize("mode", ["delete", "wal", "wal without shm"])
@@ -232,25 +167,9 @@ def test_list_names_the_actions_in_their_order(preview):
     assert preview("--list", 2474).split() == rows[-3:-2]
 
 
-def other_tool(tmp_path, commands):
-    """A tool that runs commands in the place of an upgrade."""
-    tool = tmp_path / "other-tool"
-    tool.write_text(f"#!/bin/sh\n[ $# = 1 ] || exit 1\n{commands}\n")
-    tool.chmod(0o755)
-    return tool
-
-
-def test_an_action_with_two_reasons_counts_once(preview, tmp_path):
-    record = "logger -p user.err -t tesselupgrader Upgrade: EX"
-    tool = other_tool(tmp_path, f"{record}-1: no; {record}-2: no; exit 255")
-    text = preview(0, tool=tool, status=255)
-    assert "failed: Upgrade: EX-1: no\nfailed: Upgrade: EX-2: no\n" in text
-    assert text.endswith(", 1 actions failed\n")
-
-
 def test_a_signal_leaves_nothing_behind(preview, tmp_path):
     sleep = f"sleep 60.{os.getpid()}"  # unlike that of another run
-    tool = other_tool(tmp_path, f"exec {sleep}")
+    tool = other_tool(tmp_path / "tool2", f"exec {sleep}")
     # It does not wait for the tool to end.
     under = "timeout --preserve-status --foreground --kill-after=20 1".split()
     preview(0, under=under, status=143, tool=tool)
@@ -261,7 +180,7 @@ def test_the_tool_writes_nothing_but_its_copies(preview, tmp_path):
     outside = tmp_path / "outside"
     outside.mkdir()
     files = f"{outside}/file /dev/shm/file /var/packages/Camveld/target/file"
-    preview(0, tool=other_tool(tmp_path, f"touch {files}; exit 0"))
+    preview(0, tool=other_tool(tmp_path / "tool2", f"touch {files} || :"))
     assert not os.listdir(outside) + list(Path("/dev/shm").glob("file"))
 
 
@@ -275,10 +194,8 @@ def test_programs_and_copies_may_be_below_var(example, kept):
     options = ["--tool", tool] if example.emulator else []
     command = [*example.emulator, f"{sbin}/tessel-preview", *options, "0"]
     ended = run("env", "TMPDIR=/var/programs", *command)
-    assert (ended.returncode, ", 0 actions failed" in ended.stdout) == (
-        0,
-        True,
-    )
+    assert ended.returncode == 0, ended.stdout
+    assert ", 0 actions failed" in ended.stdout
 
 
 def test_the_change_file_is_complete_before_the_first_line(example, kept):
@@ -294,7 +211,7 @@ def test_the_change_file_is_complete_before_the_first_line(example, kept):
     assert files == (example.upgrade(0).diffs.count("--- "),)
 
 
-FULL = "head -c 9M /dev/zero >/var/packages/Camveld/target/file 2>/dev/null"
+FULL = "head -c 9M /dev/zero >/var/packages/Camveld/target/file 2>&1 || :"
 ROOM = [
     # MB in TMPDIR, what fills it, what is said
     (1, ":", "TMPDIR needs 2 MB, has 1"),
@@ -307,7 +224,7 @@ def test_too_little_room_is_no_failure_of_the_upgrade(
     example, preview, tmp_path, kept, room, fill, said
 ):
     tool = example.script(tmp_path / "real-tool", TOOL)
-    tool = other_tool(tmp_path, f'{fill}; exec {tool} "$@"')
+    tool = other_tool(tmp_path / "tool2", f'{fill}; exec {tool} "$@"')
     size = f"size={room}m"
     mount = ["mount", "-t", "tmpfs", "-o", size, "tmpfs", tmp_path / "tmp"]
     subprocess.check_call(mount)
@@ -362,8 +279,7 @@ def test_one_line_says_why_there_is_no_preview(
     (directory / "open").mkdir()
     (directory / "open").chmod(0o775)
     (directory / "link").symlink_to(directory)
-    crash = other_tool(directory, "kill -SEGV $$")
-    crash.rename(directory / "crash")
+    other_tool(directory / "crash", "kill -SEGV $$")
     words = arguments.replace("{}", str(directory)).split()
     last = preview(*words, status=2).splitlines()[-1]
     assert "tessel-preview: " in last
