@@ -2,7 +2,6 @@
 
 import re
 import shutil
-import subprocess
 
 import pytest
 from conftest import SOURCE, complain, run
@@ -13,7 +12,6 @@ PAGE = (SOURCE / "docs/adding-a-migration.md").read_text()
 STEP = re.compile(
     r"^Insert into `([^`]+)`, ([^\n]+):\n\n```\w*\n(.*?)```", re.M | re.S
 )
-FILES = "git ls-files --cached --others --exclude-standard"
 CODE = "main/tesselupgrader.cpp"
 TEST = "/usr/bin/python3 -m pytest -q -p no:cacheprovider --build=build/quick"
 
@@ -33,10 +31,8 @@ def insert(path, place, code):
 def test_the_page_leads_to_migrations(request, tmp_path):
     if request.config.getoption("build") != "build/release":
         pytest.skip("the page is followed with the release build only")
-    files = subprocess.check_output(FILES.split(), cwd=SOURCE, text=True)
-    for name in files.splitlines():
-        (tmp_path / name).parent.mkdir(parents=True, exist_ok=True)
-        shutil.copy(SOURCE / name, tmp_path / name)
+    others = shutil.ignore_patterns("build", ".git", "__pycache__")
+    shutil.copytree(SOURCE, tmp_path, ignore=others, dirs_exist_ok=True)
     steps = STEP.findall(PAGE)
     assert len(steps) == PAGE.count("\nInsert into") > 0
     next_version = max(row[0] for table in tables() for row in table) + 1
