@@ -329,16 +329,22 @@ def example(appliance):
 
 
 @pytest.fixture
-def preview(example, tmp_path):
-    """Runs the preview, which must leave nothing and change nothing."""
-    own_tool = example.script(tmp_path / "tool", TOOL)
-    temporary = tmp_path / "tmp"
-    temporary.mkdir()
+def preview(example):
+    """Runs the preview, which must leave nothing and change nothing.
+
+    As on an appliance, it is in a mounted directory below /var.
+    """
+    own_tool = example.script(Path("/var/tool"), TOOL)
+    programs, temporary = Path("/var/programs"), Path("/var/tmp")
+    for path in programs, temporary:
+        path.mkdir()
+    subprocess.check_call(["mount", "--bind", example.build, programs])
     example.directory.chmod(0o755)  # others cannot replace a change file
 
     def run_preview(*arguments, under=(), status=0, tool=own_tool):
         before = example.state()
-        command = example.command(PREVIEW, "--tool", tool, *arguments)
+        program = programs / PREVIEW
+        command = example.command(program, "--tool", tool, *arguments)
         ended = run("env", f"TMPDIR={temporary}", *under, *command)
         assert ended.returncode == status, ended.stdout
         example.must_be_as(before)

@@ -104,8 +104,8 @@ MOVE, SPEED = [name for _, name in tables()[1]][:2]
 READ_ONLY = "creation of a temporary file: Read-only file system"
 
 
-def test_a_database_that_is_held_has_no_preview(example, preview, tmp_path):
-    command = example.command(PREVIEW, "--tool", tmp_path / "tool", 0)
+def test_a_database_that_is_held_has_no_preview(example, preview):
+    command = example.command(PREVIEW, "--tool", "/var/tool", 0)
     with closing(sqlite3.connect(example.database)) as recorder:
         recorder.execute("BEGIN EXCLUSIVE")
         said = run(*command).stdout
