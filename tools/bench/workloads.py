@@ -72,7 +72,11 @@ def instructions(command):
 
 
 def make_cameras(count):
-    """Makes START, with cameras of 600 bytes. An upgrade changes 30 %."""
+    """Makes START, with cameras of 600 bytes. An upgrade changes 30 %.
+
+    Without a directory of capability files, an upgrade would fail.
+    """
+    CAPS.mkdir(parents=True, exist_ok=True)
     START.unlink(missing_ok=True)
     db = sqlite3.connect(START)
     db.executescript((ROOT / "examples/appliance.sql").read_text())
