@@ -49,7 +49,7 @@ constexpr const char* COUNT_CELL = R"(
 
 // The rows to insert. What somebody has changed since stays.
 constexpr const char* MERGE = R"(
-  CREATE TEMP TABLE merged_{n} AS SELECT x.r, {merged}
+  CREATE TEMP TABLE merged_{n} AS SELECT x.r, x.kind = 'removed' AS removed, {merged}
   FROM temp.row_{n} AS x CROSS JOIN changes.before_{n} AS b USING ({keys})
     LEFT JOIN changes.after_{n} AS a USING ({keys}) LEFT JOIN main.{table} AS t ON {t_is_x}
   WHERE {goes_back} AND x.kind <> 'added')";
@@ -61,14 +61,13 @@ constexpr const char* DELETE = R"(
   DELETE FROM main.{table} WHERE ({collated_keys}) IN (
     SELECT {keys} FROM temp.row_{n} AS x WHERE {goes_back} AND x.kind <> 'removed'))";
 
-// A removed row gets another rowid if its own has been given to another row.
-constexpr const char* FREE_ROWIDS = R"(
-  UPDATE temp.merged_{n} AS x SET r = NULL WHERE EXISTS (
-    SELECT 1 FROM main.{table} AS t WHERE {rowid} = x.r))";
+// The table's own answers to a conflict, such as REPLACE, do not count here. A changed row comes
+// before the removed ones, so that it keeps its rowid.
+constexpr const char* INSERT_MERGED = R"(
+  INSERT OR IGNORE INTO main.{table} ({columns})
+  SELECT {values} FROM temp.merged_{n} ORDER BY removed, rowid)";
 
-// The table's own answers to a conflict, such as REPLACE, do not count here.
-constexpr const char* INSERT = R"(
-  INSERT OR IGNORE INTO main.{table} ({columns}) SELECT {values} FROM temp.merged_{n} WHERE )";
+constexpr const char* FORGET_ROWIDS = "UPDATE temp.merged_{n} SET r = NULL";
 
 constexpr const char* REFUSED = R"(
   SELECT x.rowid FROM temp.row_{n} AS x
@@ -209,12 +208,13 @@ void TableUndo::Apply(std::vector<LeftRow>* pLeft) const {
   }
   Execute(MERGE);
   Execute(DELETE);
+  Execute(INSERT_MERGED);
   if (HasOwnRowid(m_Table) && !m_Table.blRowidOnly) {
-    Execute(FREE_ROWIDS);
+    // A removed row gets another rowid if its own has been given to another row. The rows that are
+    // there already are ignored.
+    Execute(FORGET_ROWIDS);
+    Execute(INSERT_MERGED);
   }
-  // First the rows whose rowid is known, so that no other row gets it.
-  Execute(INSERT + std::string("r IS NOT NULL"));
-  Execute(INSERT + std::string("r IS NULL"));
   Statement Refused(m_Db, Fill(REFUSED, m_Words));
   while (Refused.Step()) {
     pLeft->push_back({m_Table.Number, Refused.Int(0), "UNIQUE, CHECK or NOT NULL forbids it now"});

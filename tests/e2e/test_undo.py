@@ -49,7 +49,7 @@ UPGRADE = """
     DELETE FROM relay;
     INSERT INTO output VALUES (4, 'Siren');
     DELETE FROM tag WHERE t = 'y';
-    UPDATE tag SET t = 'X', number = 3 WHERE t = 'x';"""
+    UPDATE tag SET t = 'X', number = 3, rowid = 2 WHERE t = 'x';"""
 
 
 @pytest.fixture
