@@ -5,23 +5,27 @@ import fcntl
 import os
 import re
 import time
+from contextlib import suppress
+from pathlib import Path
 from subprocess import Popen
 
 import pytest
-from conftest import CLIENT, KIDBGLOG, LOG_LINE, STRACE, run
+from conftest import CLIENT, KIDBGLOG, STRACE, run
 
-# What the client writes: the number of the line, and some zeros.
-NUMBERED = re.compile(r"f:1:Fn\(\): (\d+) (0+)")
+FILE = Path("/var/services/camveld/f")
+# What the client writes: time, thread, the number of the line, some zeros.
+LINE = re.compile(r"(\w{3} [ \d]\d \S+\.\d{3}) (\S+) f:1:Fn\(\): (\d+) (0+)")
 
 
 def test_configuration_is_attached_from_start_to_end(appliance):
-    file = appliance.directory / "f"
-    client = appliance.command(CLIENT, "get", file, "key")
+    client = appliance.command(CLIENT, "get", FILE, "key")
     # Before main, in it, after it, and at the very end of each process.
     assert run(*client).stdout == "0000"
     assert appliance.log() == ["[event][alarm] client.cpp:End(): End"] * 2
     run(*appliance.command(KIDBGLOG, "create"))
     assert run(*client).stdout == "0110"
+    forbidden = [*STRACE, "-e", "inject=shmat:error=EACCES"]
+    assert run(*forbidden, *client).stdout == "0000"
 
 
 FAILURES = [
@@ -44,22 +48,41 @@ def test_a_failing_call_is_logged_and_leaves_the_file(
     name, error, number = call.split()
     if name == "write" and appliance.preset == "tsan":
         pytest.skip("ThreadSanitizer makes calls of write of its own")
-    file = appliance.directory / "files/f"
-    file.parent.mkdir()
     text = "a=1\n" + "x" * 8000
-    file.write_text(text)
+    FILE.write_text(text)
     strace = [*STRACE, "-e", f"inject={name}:error={error}:when={number}"]
     if name in ("flock", "openat", "read"):
-        strace += ["-P", file]
-    client = appliance.command(CLIENT, action, file, "b", "2")
+        strace += ["-P", FILE]
+    client = appliance.command(CLIENT, action, FILE, "b", "2")
     ended = run(*strace, *client)
-    line = appliance.log()[0].replace(str(file), "F")
+    line = appliance.log()[0].replace(str(FILE), "F")
     line = re.sub(r"\.tmp\.\w{6}", ".tmp", line)
     assert line.startswith(f"[utils][error] fileutils.cpp:{message}")
     assert f"with errno [{getattr(errno, error)}]" in line
     assert ended.returncode == 1
-    assert file.read_text() == text
-    assert os.listdir(file.parent) == ["f"]
+    assert FILE.read_text() == text
+    assert os.listdir(FILE.parent) == ["f"]
+
+
+def test_a_change_keeps_the_rights_and_opens_nothing_for_others(appliance):
+    FILE.touch()
+    with suppress(OSError):  # an ordinary user may not
+        os.chown(FILE, 12, 34)
+    FILE.chmod(0o6652)
+    before = FILE.stat()
+    trace = Path("/var/trace")
+    client = appliance.command(CLIENT, "set", FILE, "key", "value")
+    run(*STRACE, "-o", trace, "-e", "%file", *client)
+    after = FILE.stat()
+    assert after.st_mode == before.st_mode
+    assert (after.st_uid, after.st_gid) == (before.st_uid, before.st_gid)
+    calls = re.findall(r'^\w+\(.*"/var/.*', trace.read_text(), re.M)
+    # Who may write the directory can put a link in place of the new file.
+    new = [call for call in calls if f"{FILE}.tmp." in call]
+    assert len(new) == 2 and "O_EXCL" in new[0] and "rename" in new[1], new
+    # A child that inherits a descriptor keeps its lock.
+    inherited = [c for c in calls if "open" in c and "O_CLOEXEC" not in c]
+    assert not inherited
 
 
 def test_a_log_that_stays_locked_loses_a_line_and_holds_nobody(appliance):
@@ -76,32 +99,24 @@ def test_lines_stay_whole_and_in_order_while_the_log_is_rotated(appliance):
     writers = [Popen(client) for _ in range(8)]
     logs = []
     for rotation in range(10):
-        for _ in range(300):  # up to a minute, on a busy machine
-            time.sleep(0.2)
-            if appliance.log_file.exists():
-                break
-        old = f"{appliance.log_file}.{rotation}"
-        logs.append(appliance.log_file.rename(old))
+        time.sleep(0.5)
+        if appliance.log_file.exists():
+            old = f"{appliance.log_file}.{rotation}"
+            logs.append(appliance.log_file.rename(old))
     for writer in writers:
         writer.kill()
         writer.wait()
-    numbers = {}
+    numbers = {}  # of the last line of each thread
     for log in logs:
-        check_lines(log, numbers)
+        last_time = ""
+        for line in log.read_text().splitlines():
+            parts = LINE.fullmatch(line)
+            assert parts, f"not a whole line in {log.name}: {line}"
+            written, thread, number, zeros = parts.groups()
+            due = numbers.get(thread, 0) + 1
+            assert int(number) == due, f"not line {due} of {thread}: {line}"
+            assert len(zeros) == due % 300 + 1, f"not a whole line: {line}"
+            assert written >= last_time, f"before {last_time}: {line}"
+            numbers[thread] = due
+            last_time = written
     assert len(numbers) >= 4, "fewer than two processes have written"
-
-
-def check_lines(log, numbers):
-    """Checks each line, and that it follows the last one of its thread."""
-    last_time = ""
-    for line in log.read_text().splitlines():
-        parts = LOG_LINE.fullmatch(line)
-        text = NUMBERED.fullmatch(parts[3]) if parts else None
-        assert text, f"not a whole line in {log.name}: {line}"
-        written, thread, number = parts[1], parts[2], int(text[1])
-        assert len(text[2]) == number % 300 + 1, f"not a whole line: {line}"
-        assert written >= last_time, f"earlier than the line before: {line}"
-        last = numbers.get(thread, 0)
-        assert number == last + 1, f"not behind {last} in {log.name}: {line}"
-        numbers[thread] = number
-        last_time = written

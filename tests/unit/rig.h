@@ -5,13 +5,11 @@
 #include <sys/mount.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <filesystem>
 #include <fstream>
 #include <regex>
 #include <string>
-#include <vector>
 
 namespace fs = std::filesystem;
 
@@ -27,40 +25,11 @@ inline void WriteFile(const std::string& strPath, const std::string& strText) {
   std::ofstream(strPath, std::ios::binary) << strText;
 }
 
-// Type and permissions, owner and group.
-inline std::vector<unsigned> Rights(const char* szPath) {
-  struct stat Stat = {};
-  lstat(szPath, &Stat);
-  return {Stat.st_mode, Stat.st_uid, Stat.st_gid};
-}
-
-struct LogLine {
-  std::string strTime;
-  std::string strProcess;  // in brackets
-  std::string strRest;     // without the line number in front of the function
-};
-
-// The lines of a log. A line that does not begin as it should has only a rest.
-inline std::vector<LogLine> LogLines(const char* szFile) {
-  static const std::regex Parts(R"((\w{3} [ \d]\d [\d:]{8}) ((?:\[\d+\]){1,2}) ?([^:]*:)\d+:(.*))");
-  std::vector<LogLine> Lines;
-  std::ifstream File(szFile);
-  for (std::string strLine; std::getline(File, strLine);) {
-    std::smatch Match;
-    const bool blWhole = std::regex_match(strLine, Match, Parts);
-    Lines.push_back(blWhole ? LogLine{Match[1], Match[2], Match.str(3) + Match.str(4)}
-                            : LogLine{"", "", strLine});
-  }
-  return Lines;
-}
-
-// The text of the log, without times, process ids and line numbers.
+// The text of the log without times, process ids and line numbers, of lines that begin as they
+// should.
 inline std::string LogText() {
-  std::string strText;
-  for (const LogLine& Line : LogLines(LOG_FILE)) {
-    strText += Line.strRest + "\n";
-  }
-  return strText;
+  static const std::regex Parts(R"(\w{3} [ \d]\d [\d:]{8} (\[\d+\]){1,2} ?([^:\n]*:)\d+:)");
+  return std::regex_replace(ReadFile(LOG_FILE), Parts, "$2");
 }
 
 // Each test starts with the empty directories of an appliance.
@@ -69,8 +38,7 @@ class PrivateVar : public ::testing::Test {
   void SetUp() override {
     ASSERT_NE(getenv("TESSEL_PRIVATE_VAR"), nullptr) << "start it with tools/private-var";
     ASSERT_EQ(mount("tmpfs", "/var", "tmpfs", 0, nullptr), 0);  // over that of the test before
-    for (const char* szDir :
-         {"log/camveld", "services/camveld", "packages/Camveld/etc", "packages/Camveld/target"}) {
+    for (const char* szDir : {"log/camveld", "services/camveld", "packages/Camveld/target"}) {
       fs::create_directories(std::string("/var/") + szDir);
     }
     WriteFile(SYSTEM_DB, "");
