@@ -1,7 +1,6 @@
-"""The arguments of the tool, and the directories that it needs."""
+"""The arguments of the tool."""
 
 import re
-import shutil
 
 import pytest
 
@@ -11,10 +10,8 @@ USAGE = (
     r"\{pre-upgrade-version\}\|\{--updateCap remote-cap-dir\}\n"
 )
 
-OTHERS = ["", "1 2", "1 2 3", "--updatecap /tmp", "--updateCap / 3"]
 
-
-@pytest.mark.parametrize("arguments", OTHERS)
+@pytest.mark.parametrize("arguments", ["", "1 2", "--updateCap / 3"])
 def test_other_arguments_only_print_the_usage(example, arguments):
     result = example.upgrade(*arguments.split())
     result.must_be(1)
@@ -34,23 +31,6 @@ NUMBERS = [
 def test_a_version_counts_as_far_as_it_is_a_number(
     appliance, argument, number
 ):
-    result = appliance.upgrade(argument)
+    log = appliance.upgrade(argument).log
     start = "tesselupgrader.cpp:main(): TESSEL pre-upgrade version"
-    assert result.log[0] == f"{start}: {number}"
-
-
-MISSING = [
-    # what is missing below the target directory, arguments, exit status
-    ("@camveld/@KICapInfo", [0], 0),
-    ("@camveld", [0], 255),
-    ("@camveld", ["--updateCap", ""], 255),
-]
-
-
-@pytest.mark.parametrize("missing, arguments, status", MISSING)
-def test_without_the_packages_directory(example, missing, arguments, status):
-    directory = example.directory / missing
-    shutil.rmtree(directory)
-    example.upgrade(*arguments).must_be(status)
-    directory.touch()
-    example.upgrade(*arguments).must_be(status)
+    assert log[0] == f"{start}: {number}"
