@@ -61,22 +61,38 @@ def test_without_a_directory_syslog_says_so(
     example.upgrade(*arguments).must_be(status)
 
 
+STEP = b"pan= step\n"
+BINARY = bytes(range(11, 256)) * 400 + b"\na=\0\n"
+OTHERS = b"#pan=yes\nPAN=yes\npann=yes\nx=pan\n=pan\npan\n\r\n \n"
+LARGE = b"pan=yes\n".rjust(2**24 + 1, b"\n")
+FILES = {
+    # a name, the file's text before and after an upgrade
+    "../where a link leads": (b"pan=yes\n", STEP),
+    "new\nline": (b"pan=yes\n", STEP),
+    ".hidden": (b"pan=yes\n", STEP),
+    "binary": (BINARY + b"pan=yes", BINARY + STEP),
+    "large": (LARGE, LARGE),
+    "others": (OTHERS, OTHERS),
+    "twice": (
+        b"a=1\npan=yes\nb=3\npan=4\n\n pan\t=5",
+        b"a=1\n%bb=3\n\n" % STEP,
+    ),
+    "blanks": (b" pan\t=\t yes \t\r\nb=3", STEP + b"b=3"),
+    "quoted": (b'pan = "yes"\r\n', STEP),
+    "quoted twice": (b'pan=""yes""\n', b'pan=""yes""\n'),
+    "one quote": (b'pan="yes\n', b'pan="yes\n'),
+}
+
+
 def test_a_directory_of_strange_files(appliance, syslog):
     caps = appliance.caps
-    outside = appliance.directory / "outside"
-    owned = caps / "new\nline"
-    binary = bytes(range(11, 256)) * 400 + b"\n"
-    starts = {outside: b"", caps / ".hidden": b"", owned: b""}
-    starts[caps / "binary"] = binary
-    for file, start in starts.items():
-        file.write_bytes(start + b"pan=yes\n")
+    for name, (before, _) in FILES.items():
+        (caps / name).write_bytes(before)
     with suppress(OSError):  # an ordinary user may not
-        os.chown(owned, 12, 34)
-    owned.chmod(0o6440)
-    rights = owned.stat()
-    large = b"pan=yes\n".rjust(2**24 + 1, b"\n")
-    (caps / "large").write_bytes(large)
-    (caps / "link").symlink_to(outside)
+        os.chown(caps / ".hidden", 12, 34)
+    (caps / ".hidden").chmod(0o6440)
+    rights = (caps / ".hidden").stat()
+    (caps / "link").symlink_to("../where a link leads")
     (caps / "dangling").symlink_to("none")
     (caps / "directory").mkdir()
     os.mkfifo(caps / "fifo")
@@ -84,13 +100,13 @@ def test_a_directory_of_strange_files(appliance, syslog):
     (caps / ".zamoc.tmp").write_text("of a killed run")
 
     appliance.upgrade("--updateCap", CAPS).must_be(0)
-    for file, start in starts.items():
-        assert file.read_bytes() == start + b"pan= step\n", file
+    for name, (_, after) in FILES.items():
+        assert (caps / name).read_bytes() == after, name
     reason = "large: larger than 16 MiB"
     assert syslog() == [f"{name}: {reason}" for name in ACTIONS]
-    assert (caps / "large").read_bytes() == large, "above 16 MiB, but changed"
-    assert owned.stat().st_mode == rights.st_mode
-    assert owned.stat()[4:6] == rights[4:6], "another owner or group"
+    now = (caps / ".hidden").stat()
+    assert now.st_mode == rights.st_mode
+    assert (now.st_uid, now.st_gid) == (rights.st_uid, rights.st_gid)
     assert (caps / "link").is_symlink()
     assert sorted(os.listdir(caps)) == entries
 

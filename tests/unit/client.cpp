@@ -31,15 +31,13 @@ static void WriteLines() {
   }
 }
 
-// loop CATEG LEVEL | write | get FILE KEY | set FILE KEY VALUE
+// loop | write | get FILE KEY | set FILE KEY VALUE
 int main(int /*argc*/, char** argv) {
   const std::string strCommand = argv[1];
   PrintAttached();
   alarm(30);  // a failed test may leave the process behind
   while (strCommand == "loop") {
-    const auto Categ = static_cast<LOG_CATEG>(std::stoi(argv[2]));
-    const auto Level = static_cast<LOG_LEVEL>(std::stoi(argv[3]));
-    KIDBGLOG(Categ, Level, "x\n");
+    KIDBGLOG(LOG_CATEG_RTSP_SERVER, LOG_LEVEL_DEBUG, "x\n");
     usleep(10000);
   }
   if (strCommand == "write") {

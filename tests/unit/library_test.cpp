@@ -17,7 +17,6 @@
 
 namespace {
 
-using KeyValMap = std::map<std::string, std::string>;
 using Numbers = std::vector<int32_t>;
 
 constexpr const char* NAME = "/var/services/camveld/f";
@@ -36,44 +35,34 @@ void Interrupt(useconds_t usec) {
   ualarm(usec, usec);
 }
 
-KeyValMap Read(const std::string& strText) {
-  KeyValMap KeyVals = {{"old", "old"}};
-  WriteFile(NAME, strText);
-  KiFileGetAllKeyVals(NAME, KeyVals);
-  return KeyVals;
-}
-
-TEST_F(KeyVal, LinesCarryPairs) {
-  std::string strVal;
-  EXPECT_EQ(Read("b=1\na=2\nb=3\n"), (KeyValMap{{"a", "2"}, {"b", "1"}}));
-  EXPECT_EQ(KiFileGetVal(NAME, "b", strVal), 2);  // lines
-  EXPECT_EQ(strVal, "1");
-  EXPECT_EQ(Read("junk\n\n#a=b\n=x\n"), (KeyValMap{{"#a", "b"}, {"", "x"}}));
-  EXPECT_EQ(Read(" a = \"b c\" \nd= e\n"), (KeyValMap{{" a ", "b c"}, {"d", " e"}}));
-  EXPECT_EQ(Read("a=x\"b\"c\"y\nd=\"e\n"), (KeyValMap{{"a", "b\"c"}, {"d", "\"e"}}));
-  EXPECT_EQ(Read("a=1=2\nb=\"\"\nc=3\r"), (KeyValMap{{"a", "1=2"}, {"b", ""}, {"c", "3\r"}}));
-}
-
 TEST_F(KeyVal, ChangesLeaveSortedPairs) {
-  WriteFile(NAME, "#c\nb=\"2\"\n\na=1\nb=3\n");
-  EXPECT_EQ(KiFileSetVals(NAME, {{"b", "x"}, {"", "y"}}, false), 0);
-  EXPECT_EQ(ReadFile(NAME), "=y\na=1\nb=x\n");
-  EXPECT_EQ(KiFileSetVal(NAME, "c", "a\"b\"c", true), 0);
-  EXPECT_EQ(ReadFile(NAME), "=\"y\"\na=\"1\"\nb=\"x\"\nc=\"a\"b\"c\"\n");
-  EXPECT_EQ(KiFileRemoveKeys(NAME, {"", "b", "none"}), 0);
-  EXPECT_EQ(KiFileRemoveKey(NAME, "c"), 0);
-  EXPECT_EQ(ReadFile(NAME), "a=1\n");
+  const struct {
+    const char* szBefore;
+    const char* szAfter;  // a key was removed
+  } rgCase[] = {
+      {"b=1\na=2\nb=3\nk=4\n", "a=2\nb=1\n"},         {"junk\n\n#a=b\n=x\n", "=x\n#a=b\n"},
+      {" a = \"b c\" \nd= e\n", " a =b c\nd= e\n"},   {"a=x\"b\"c\"y\nd=\"e\n", "a=b\"c\nd=\"e\n"},
+      {"a=1=2\nb=\"\"\nc=3\r", "a=1=2\nb=\nc=3\r\n"},
+  };
+  for (const auto& Case : rgCase) {
+    WriteFile(NAME, Case.szBefore);
+    EXPECT_EQ(KiFileRemoveKey(NAME, "k"), 0);
+    EXPECT_EQ(ReadFile(NAME), Case.szAfter);
+  }
+  EXPECT_EQ(KiFileSetVals(NAME, {{"", "y"}, {"c", "a\"b\"c"}}, true), 0);
+  EXPECT_EQ(KiFileRemoveKeys(NAME, {"b", "none"}), 0);
+  EXPECT_EQ(ReadFile(NAME), "=y\na=1=2\nc=a\"b\"c\n");
 }
 
 TEST_F(KeyVal, NoChangeIsLostBesideOthersAndInSpiteOfSignals) {
-  constexpr int Changes = 100;
+  constexpr unsigned Changes = 100;
   std::vector<std::thread> Threads;
   WriteFile(NAME, "");
   Interrupt(0);
   for (const char* szKey : {"a", "b", "c", "d"}) {
     Threads.emplace_back([szKey] {
       std::string strVal;
-      for (int Change = 0; Change < Changes; ++Change) {
+      for (unsigned Change = 0; Change < Changes; ++Change) {
         const std::string strKey = szKey + itos(Change);
         EXPECT_EQ(KiFileSetVal(NAME, strKey.c_str(), "1", true), 0);
         EXPECT_EQ(KiFileGetVal(NAME, strKey.c_str(), strVal), 1) << strKey;
@@ -89,8 +78,9 @@ TEST_F(KeyVal, NoChangeIsLostBesideOthersAndInSpiteOfSignals) {
   for (std::thread& Thread : Threads) {
     Thread.join();
   }
-  KeyValMap KeyVals;
-  EXPECT_EQ(KiFileGetAllKeyVals(NAME, KeyVals), 4 * Changes);
+  std::map<std::string, std::string> KeyVals = {{"old", "old"}};
+  EXPECT_EQ(KiFileGetAllKeyVals(NAME, KeyVals), 4 * Changes);  // lines
+  EXPECT_EQ(KeyVals.size(), 4 * Changes);
 }
 
 TEST_F(KeyVal, CancelledThreadFinishesWhatItBegan) {
