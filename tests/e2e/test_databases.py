@@ -51,6 +51,7 @@ NO_FILE = "too many attached databases - max 0 (extended code 1)"
 VALUES = [
     # a text in the value of a camera, the reason of the failure
     ("ATTACH '/var/outside' AS o", NO_FILE),
+    ("SELECT 1", "the text leaves a transaction open (extended code 0)"),
     ("VACUUM INTO '/var/outside'", NO_FILE),
     (
         "SELECT [no\n<3>column]",

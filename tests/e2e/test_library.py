@@ -65,11 +65,12 @@ def test_a_failing_call_is_logged_and_leaves_the_file(
 
 
 def test_a_change_opens_nothing_for_others(appliance):
-    FILE.touch(0o640)
+    FILE.touch()
+    FILE.chmod(0o6640)
     trace = Path("/var/trace")
     client = appliance.command(CLIENT, "set", FILE, "key", "value")
     run(*STRACE, "-o", trace, "-e", "%file", *client)
-    assert oct(FILE.stat().st_mode) == "0o100640"
+    assert oct(FILE.stat().st_mode) == "0o106640"
     calls = re.findall(r'^\w+\(.*"/var/.*', trace.read_text(), re.M)
     # Who may write the directory can put a link in place of the new file.
     new = [call for call in calls if f"{FILE}.tmp." in call]
