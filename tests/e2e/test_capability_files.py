@@ -17,6 +17,7 @@ MARKED = "ptz_continuous_move=yes\n"
 
 DISTURBED = [
     # text of a file; call that fails, error, number; status, reason
+    # Only the removal of the marker has to work.
     (MARKED, "read EINTR 1", 0, ""),
     (MARKED, "fsync EINVAL 2", 0, ""),  # directories cannot be synced
     (MARKED, "fsync EIO 2", 255, "fsync of the directory"),
@@ -26,7 +27,7 @@ DISTURBED = [
 
 
 @pytest.mark.parametrize("text, call, status, reason", DISTURBED)
-def test_only_the_removal_of_the_marker_has_to_work(
+def test_what_a_failed_call_costs(
     appliance, syslog, text, call, status, reason
 ):
     file = appliance.capability_file("camera", text)

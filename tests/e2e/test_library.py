@@ -69,7 +69,9 @@ def test_a_change_opens_nothing_for_others(appliance):
     FILE.chmod(0o6640)
     trace = Path("/var/trace")
     client = appliance.command(CLIENT, "set", FILE, "key", "value")
-    run(*STRACE, "-o", trace, "-e", "%file", *client)
+    signal = "inject=flock:error=EINTR:when=1"
+    run(*STRACE, "-o", trace, "-e", "%file,flock", "-e", signal, *client)
+    assert FILE.read_text() == 'key="value"\n'
     assert oct(FILE.stat().st_mode) == "0o106640"
     calls = re.findall(r'^\w+\(.*"/var/.*', trace.read_text(), re.M)
     # Who may write the directory can put a link in place of the new file.
