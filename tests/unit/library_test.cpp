@@ -79,11 +79,11 @@ TEST_F(KeyVal, NoChangeIsLostBesideOthers) {
 
 TEST_F(KeyVal, CancelledThreadFinishesWhatItBegan) {
   WriteFile(NAME, "a=1\n");
-  const auto Steps = [](void (*pBegin)()) {
+  const auto Steps = [](const auto& Begin) {
     int Done = 0;
-    std::thread([&Done, pBegin] {
+    std::thread([&Done, &Begin] {
       pthread_cancel(pthread_self());
-      pBegin();
+      Begin();
       ++Done;
       pthread_testcancel();  // ends here: cancellation is enabled again
       ++Done;
@@ -94,12 +94,9 @@ TEST_F(KeyVal, CancelledThreadFinishesWhatItBegan) {
   EXPECT_EQ(Steps([] { KiFileSetVal(NAME, "a", "1", false); }), 1);
   EXPECT_EQ(Steps([] { KiFlock("/var/lock").LockEx(0); }), 1);
   EXPECT_EQ(Steps([] { const fileops::Descriptor Fd(dup(0)); }), 1);
-  EXPECT_EQ(Steps([] {
-              std::string strVal;
-              KiFileGetVal(NAME, "a", strVal);  // ends in it, with nothing locked
-            }),
-            0);
-  EXPECT_EQ(KiFlock(NAME).LockEx(0), 0);
+  std::string strVal;
+  EXPECT_EQ(Steps([&strVal] { KiFileGetVal(NAME, "a", strVal); }), 0);  // ends in it
+  EXPECT_EQ(KiFlock(NAME).LockEx(0), 0) << "the reader has kept its lock";
 }
 
 TEST_F(KeyVal, LockExcludesOthersAsLongAsItIsTold) {

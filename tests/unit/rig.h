@@ -14,7 +14,6 @@
 namespace fs = std::filesystem;
 
 constexpr const char* LOG_FILE = "/var/log/camveld/camveld.log";
-constexpr const char* SYSTEM_DB = "/var/packages/Camveld/target/system.db";
 
 inline std::string ReadFile(const std::string& strPath) {
   std::ifstream File(strPath, std::ios::binary);
@@ -41,7 +40,7 @@ class PrivateVar : public ::testing::Test {
     for (const char* szDir : {"log/camveld", "services/camveld", "packages/Camveld/target"}) {
       fs::create_directories(std::string("/var/") + szDir);
     }
-    WriteFile(SYSTEM_DB, "");
+    WriteFile("/var/packages/Camveld/target/system.db", "");
     umask(0);
     const rlimit Descriptors = {40, 40};  // too few for a call in a loop that leaves one open
     setrlimit(RLIMIT_NOFILE, &Descriptors);
