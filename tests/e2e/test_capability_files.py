@@ -75,7 +75,7 @@ FILES = {
     "blanks": (b" pan\t=\t yes \t\r\nb=3", STEP + b"b=3"),
     "quoted": (b'pan = "yes"\r\n', STEP),
     "quoted twice": (b'pan=""yes""\n', b'pan=""yes""\n'),
-    "one quote": (b'pan="yes\n', b'pan="yes\n'),
+    "one quote": (b'pan="yes.\ntilt=.yes"\n', b'pan="yes.\ntilt=.yes"\n'),
 }
 
 
@@ -101,7 +101,7 @@ def test_a_directory_of_strange_files(appliance, syslog):
     assert syslog() == [f"{name}: {reason}" for name in ACTIONS]
     now = (caps / ".hidden").stat()
     assert now.st_mode == rights.st_mode
-    assert (now.st_uid, now.st_gid) == (rights.st_uid, rights.st_gid)
+    assert (now.st_uid, now.st_gid) == (rights.st_uid, rights.st_gid), "owner"
     assert (caps / "link").is_symlink()
     assert sorted(os.listdir(caps)) == entries
 

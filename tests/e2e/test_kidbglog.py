@@ -46,8 +46,7 @@ def test_a_running_process_logs_what_is_set(appliance, kidbglog):
             time.sleep(0.1)  # a line may be on its way
             appliance.log_file.write_text("")
             time.sleep(0.3)
-            text = appliance.log_file.read_text()
-            assert (text != "") == expected, command
+            assert bool(appliance.log_file.read_text()) == expected, command
         process.terminate()
 
 
