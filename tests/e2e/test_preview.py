@@ -31,6 +31,7 @@ AWKWARD = r"""
     CREATE TABLE added (id INTEGER PRIMARY KEY AUTOINCREMENT, v);
     CREATE VIEW seen AS SELECT 1;"""
 CHANGES = r"""
+    CREATE TABLE fresh (v); DROP TABLE setting;
     UPDATE camera SET resolution = 'it''s \', motion_area = x'00' WHERE id = 3;
     UPDATE "o'd ""tab"" 1" SET rowid = x'01', d = d || CAST(x'd8c3' AS TEXT);
     UPDATE "o'd ""tab"" 1" SET "a b" = 'it''s \' WHERE "a b" = 1.5;
