@@ -15,6 +15,7 @@ from typing import NamedTuple
 TARGET = "/var/packages/Camveld/target"
 TOOL = ["build/release/sbin/tesselupgrader", "0"]
 DATABASE = "system.db"
+SYSTEM = f"{TARGET}/{DATABASE}"
 CAPS = "@camveld/@KICapInfo"
 LOG = Path("/var/log/camveld/camveld.log")
 TRACE = Path("/var/trace")
@@ -103,22 +104,12 @@ def changed(content, changes):
 
 @lru_cache(maxsize=64)
 def versions(synced, changes):
-    """All, none, each, all but one of the changes, or the last one torn."""
+    """All, none, each, or all but one of the changes."""
     choices = [changes, ()]
     for place in range(max(0, len(changes) - LATEST), len(changes)):
         others = changes[:place] + changes[place + 1 :]
         choices += [changes[place : place + 1], others]
-    for offset, data in changes[-1:]:
-        ends = range(512 - offset % 512, len(data), 512)  # of sectors
-        choices += [(*changes[:-1], (offset, data[:end])) for end in ends]
     return list(dict.fromkeys(changed(synced, choice) for choice in choices))
-
-
-class Call(NamedTuple):
-    name: str  # and its number among the calls of this name, from 1
-    line: str
-    disk: Model  # after the call
-    step: int  # the last step before it
 
 
 def run(disk, *command):
@@ -130,50 +121,14 @@ def run(disk, *command):
     return done.returncode, read_disk()
 
 
-def disturb(disk, call, what, command=TOOL):
-    """Runs a command, and disturbs a call or, with a plus, all from there."""
-    name, number = call.split()
-    # The filter is faster, but signals do not come through it.
-    fast = [] if "signal" in what else ["--seccomp-bpf", "-f"]
-    when = number + ("+" if what.endswith("+") else "")
-    inject = f"--inject={name}:{what.rstrip('+')}:when={when}"
-    strace = ["strace", *fast, "-o", TRACE, f"--trace={name}", inject]
-    status, left = run(disk, *strace, *command)
-    came = status == -9 or "INJECTED" in TRACE.read_text()
-    assert came, "the call did not come"
-    return status, left
-
-
-def record(disk, *command):
-    """Returns a run's calls, and the rows and capability files it shows."""
-    strace = ["strace", "-qq", "-y", "-s", "1000000", "-o", TRACE]
-    status, end = run(disk, *strace, *command)
-    assert status == 0, f"{command} ended with {status}"
-    calls, steps, versions = [], [rows(disk)], set()
-    files = {n: (content, ()) for n, content in enumerate(disk.values())}
-    model, count = Model(files, (dict(zip(disk, files)),)), Counter()
-    for line in TRACE.read_text().splitlines():
-        model = model.after(line)
-        if re.match(f"close.*/{DATABASE}>", line):
-            now = rows(model.live())
-            steps += [now] if now != steps[-1] else []
-        if re.match(f'openat.*/{CAPS}", .*O_NONBLOCK|exit_group', line):
-            versions.update(capabilities(model.live()).items())
-        name = line.split("(")[0]
-        count[name] += 1
-        step = len(steps) - 1
-        calls.append(Call(f"{name} {count[name]}", line, model, step))
-    assert model.live().items() <= end.items(), "the model is wrong"
-    return calls, steps, versions
-
-
 def rows(disk):
-    """The database as lines of SQL."""
+    """The database as lines of SQL, without the counters of ids."""
     write_disk(disk, "/var/copy")
     with closing(sqlite3.connect(f"/var/copy/{DATABASE}")) as database:
         integrity = database.execute("PRAGMA integrity_check").fetchall()
         assert integrity == [("ok",)], f"the database is damaged: {integrity}"
-        return tuple(database.iterdump())
+        dump = database.iterdump()
+        return tuple(line for line in dump if "sqlite_sequence" not in line)
 
 
 def different(disk, other):
@@ -185,19 +140,70 @@ def capabilities(disk):
     return {name: disk[name] for name in disk if name.startswith(CAPS)}
 
 
-class Appliance:
-    def __init__(self, wal):
-        self.wal = wal
-        shutil.copytree("examples/KICapInfo", f"{TARGET}/{CAPS}")
-        with closing(sqlite3.connect(f"{TARGET}/{DATABASE}")) as db:
-            db.execute(f"PRAGMA journal_mode={'wal' if wal else 'delete'}")
-            db.executescript(Path("examples/appliance.sql").read_text())
-        self.start = read_disk()
-        self.calls, self.steps, self.versions = record(self.start, *TOOL)
-        # The second action on capability files alone, as after a failed first.
-        self.versions |= record(self.start, TOOL[0], "70")[2]
-        self.end = self.calls[-1].disk.live()
+def create(*settings):
+    """Puts the example on the disk, with settings of its database."""
+    write_disk({})
+    shutil.copytree("examples/KICapInfo", f"{TARGET}/{CAPS}")
+    with closing(sqlite3.connect(SYSTEM)) as db:
+        for setting in settings:
+            db.execute(f"PRAGMA {setting}")
+        script = Path("examples/appliance.sql").read_text()
+        db.executescript(f"BEGIN; {script}; COMMIT")
+    return read_disk()
+
+
+class Call(NamedTuple):
+    name: str  # and its number among the calls of this name, from 1
+    line: str
+    disk: Model  # after the call
+    step: int  # the last step before it
+
+
+class Recording:
+    """A run of a command on a disk, and what it may leave if disturbed."""
+
+    def __init__(self, start, *command):
+        self.start, self.command = start, command
+        strace = ["strace", "-qq", "-y", "-s", "1000000", "-o", TRACE]
+        status, end = run(start, *strace, *command)
+        assert status == 0, f"{command} ended with {status}"
+        self.calls = []
+        self.steps = [rows(start)]  # the rows after each transaction
         self.failures = []  # the rows after one failed transaction
+        self.versions = set(capabilities(start).items())
+        files = {n: (content, ()) for n, content in enumerate(start.values())}
+        model, count = Model(files, (dict(zip(start, files)),)), Counter()
+        for line in TRACE.read_text().splitlines():
+            model = model.after(line)
+            if re.match(f"close.*/{DATABASE}>", line):
+                now = rows(model.live())
+                self.steps += [now] if now != self.steps[-1] else []
+            if re.match(f'openat.*/{CAPS}", .*O_NONBLOCK|exit_group', line):
+                self.versions.update(capabilities(model.live()).items())
+            name = line.split("(")[0]
+            count[name] += 1
+            name, step = f"{name} {count[name]}", len(self.steps) - 1
+            self.calls.append(Call(name, line, model, step))
+        self.end = model.live()
+        assert self.end.items() <= end.items(), "the model is wrong"
+
+    def changes(self):
+        """The calls that can change something."""
+        change = "p?write|ftrunc|f(data)?sync|fch|rename|unlink|open.*O_CREAT"
+        return [call for call in self.calls if re.match(change, call.line)]
+
+    def disturb(self, call, what):
+        """Disturbs a call or, with a plus, all from there."""
+        name, number = call.name.split()
+        # The filter is faster, but signals do not come through it.
+        fast = [] if "signal" in what else ["--seccomp-bpf", "-f"]
+        when = number + ("+" if what.endswith("+") else "")
+        inject = f"--inject={name}:{what.rstrip('+')}:when={when}"
+        strace = ["strace", *fast, "-o", TRACE, f"--trace={name}", inject]
+        status, left = run(self.start, *strace, *self.command)
+        came = status == -9 or "INJECTED" in TRACE.read_text()
+        assert came, "the call did not come"
+        return status, left
 
     def check(self, left):
         """Rows and files are whole, and a next run makes up. Returns rows."""
@@ -208,16 +214,17 @@ class Appliance:
         parts = capabilities(left).items() - self.versions
         parts = {name for name, _ in parts} & self.start.keys()
         assert not parts, f"neither an old nor a new version: {parts}"
-        status, end = run(left, *TOOL)
+        status, end = run(left, *self.command)
         assert status == 0, "the next run fails"
         # UpdateAxisA8105E adds its rows each time. After a failed action,
         # UpdatePanasoniciPro2Panasonic renames that action's cameras.
-        known = "DO 2|sqlite_sequence"
-        if now not in self.steps:
-            known += "|Panasonic"
+        known = "DO 2" if now in self.steps else "DO 2|Panasonic"
         other = set(rows(end)) ^ set(self.steps[-1])
         other = [line for line in other if not re.search(known, line)]
         assert not other, f"the next run comes to other rows: {other[:4]}"
         other = different(end, self.end) - {DATABASE}
         assert not other, f"the next run comes to other files: {other}"
         return now
+
+    def check_kill(self, call):
+        self.check(self.disturb(call, "signal=KILL")[1])
