@@ -29,8 +29,8 @@ NAME_AS_VALUE = re.compile(
     r"""[=<>]\s*(['"]?)([a-z_]\w*)\1(?=\s*([,;)]|$|\b(WHERE|AND|OR)\b))""",
     re.I,
 )
-# These tests share a process, since finding all transactions takes seconds.
-with_transactions = pytest.mark.xdist_group("transactions")
+# One process runs these tests, since finding all transactions takes seconds.
+pytestmark = pytest.mark.xdist_group("migrations")
 
 
 @dataclass
@@ -136,7 +136,6 @@ def transactions(request):
         return find_transactions(example)
 
 
-@with_transactions
 def test_the_actions_and_their_transactions(transactions, accepts):
     thresholds = {name: threshold for threshold, name in tables()[0]}
     lines = ["# Threshold and name of each action; * begins a transaction."]
@@ -178,7 +177,6 @@ def test_each_version_selects_the_actions_above_it(appliance):
             complain(f"{title}, or must not run: {differ}")
 
 
-@with_transactions
 def test_every_statement_says_what_it_means(transactions, example):
     columns = {name for row in example.rows().values() for name in row}
     wrong = []
@@ -200,7 +198,6 @@ def test_every_statement_says_what_it_means(transactions, example):
         complain(wrong[0], wrong[1:])
 
 
-@with_transactions
 def test_the_example_needs_every_literal(transactions, example):
     wrong = []
     database = sqlite3.connect(example.database, isolation_level=None)
@@ -280,7 +277,6 @@ def test_a_second_upgrade_changes_no_row_and_no_file(example, accepts):
     accepts("second-upgrade.txt", title, second.changes)
 
 
-@with_transactions
 def test_rows_do_what_they_say_and_none_is_removed(transactions, example):
     rows = example.rows()
     changes = upgrade(example).changes
@@ -319,7 +315,6 @@ def test_capability_files_do_what_they_say(example):
             complain(f"{name} begins with neither # changes nor # must stay")
 
 
-@with_transactions
 def test_an_action_that_fails_in_the_middle_leaves_this(transactions, accepts):
     lines = ["# What is not done if an action's second transaction fails."]
     actions = []

@@ -104,11 +104,14 @@ def changed(content, changes):
 
 @lru_cache(maxsize=64)
 def versions(synced, changes):
-    """All, none, each, or all but one of the changes."""
+    """All, none, each, all but one of the changes, or the last one torn."""
     choices = [changes, ()]
     for place in range(max(0, len(changes) - LATEST), len(changes)):
         others = changes[:place] + changes[place + 1 :]
         choices += [changes[place : place + 1], others]
+    for offset, data in changes[-1:]:
+        ends = range(512 - offset % 512, len(data), 512)  # of sectors
+        choices += [(*changes[:-1], (offset, data[:end])) for end in ends]
     return list(dict.fromkeys(changed(synced, choice) for choice in choices))
 
 

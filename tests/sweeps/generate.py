@@ -57,9 +57,7 @@ END
 CREATE TRIGGER ins_{0} AFTER INSERT ON {0} BEGIN
   UPDATE camera SET channel = new.c1 WHERE id = new.id;
 END
-""".split(
-    "\n\n"
-)
+"""
 # The largest integer is missing: after it, SQLite chooses rowids at random.
 VALUES = """
 NULL 1 1.0 0.1+0.2 1e300/7 5e-324 9e999 -9e999
@@ -144,7 +142,7 @@ def create(seed):
     for table in tables:
         columns = choice(COLUMNS).format(choice(tables))
         rows.db.execute(choice(TABLES).format(table, columns))
-        for extra in EXTRAS:
+        for extra in EXTRAS.split("\n\n"):
             if rows.chance(0.4):
                 rows.db.execute(extra.format(table))
     rows.change(40, [INSERT])

@@ -185,9 +185,9 @@ def kills(mode):
 
 def undos():
     """The cases: their names, whether always, and the checks."""
-    for seed in range(1, 401):
+    for seed in range(1, 501):
         yield f"upgrade {seed}", False, partial(check_upgrade, seed, False)
-    for seed in range(1, 251):
+    for seed in range(1, 301):
         yield f"changes {seed}", False, partial(check_upgrade, seed, True)
     yield from kills("delete")
     yield from kills("wal")
