@@ -72,7 +72,8 @@ def test_many_cameras_need_no_temporary_file(example, syslog):
     # UpdateDAHUASD4XC212S changes these cameras twice in one transaction.
     example.sql(
         "INSERT INTO camera (vendor, model, resolution, rec_bitrate_ctrl) "
-        "SELECT 'DAHUA', 'SD40212S-HN', '640x480', 2 FROM camera, camera"
+        "SELECT 'DAHUA', 'SD40212S-HN', '640x480', 2 FROM camera, camera "
+        "LIMIT 5000"
     )
     trace = Path("/var/trace")
     under = [*STRACE, "-o", trace, "-e", "openat"]
