@@ -31,6 +31,8 @@ START = """
     INSERT INTO relay VALUES (7, 3);
     CREATE TABLE word (id INTEGER PRIMARY KEY, w COLLATE NOCASE, n);
     INSERT INTO word VALUES (1, 'case', 1), (2, '', 1);
+    CREATE TRIGGER act AFTER INSERT ON word
+      BEGIN INSERT INTO note VALUES ('acted'); END;
     CREATE TABLE tag (t TEXT COLLATE NOCASE PRIMARY KEY, number UNIQUE);
     INSERT INTO tag VALUES ('x', 1), ('y', 2);
     CREATE TABLE tagged (number REFERENCES tag (number));
