@@ -65,8 +65,7 @@ def test_saved_settings_come_back_and_show_tells_what_differs(kidbglog):
             "other categories: notice\n"
             "milliseconds: on"
         )
-    kidbglog("set all alarm")
-    names = re.findall(r"\((.*)\): alarm", kidbglog("show --all"))
+    names = re.findall(r"category .*\((.*)\): ", kidbglog("show --all"))
     assert len(set(names) - {"unknown"}) == total
 
 
