@@ -55,6 +55,11 @@ def pytest_runtest_makereport(call):
         complaints.add(complaint)
 
 
+def pytest_runtest_logreport(report):
+    """Keeps pytest from printing which worker has run a failed test."""
+    vars(report).pop("node", None)
+
+
 def pytest_terminal_summary(terminalreporter, exitstatus, config):
     """Writes what is accepted, and says what is left to do."""
     failed = [
@@ -79,10 +84,11 @@ def pytest_terminal_summary(terminalreporter, exitstatus, config):
     terminalreporter.write_line(verdict)
 
 
-def complain(title, lines=()):
+def complain(title, lines=(), most=4):
     """Fails with a title and few enough lines for a screen."""
-    if len(lines) > 5:
-        lines = [*lines[:4], f"and {len(lines) - 4} lines more"]
+    if len(lines) > most:
+        rest = len(lines) - most + 1
+        lines = [*lines[: most - 1], f"and {rest} lines more"]
     lines = [line[:240] for line in (title, *lines)]
     pytest.fail("\n".join(lines), pytrace=False)
 
@@ -363,7 +369,7 @@ def accepts(request):
         new = [f"+ {line}" for line in lines if line not in expected]
         title = f"{TO_ACCEPT}{title} (tests/expected/{name})"
         if missing or new:
-            complain(title, missing + new)
+            complain(title, missing + new, most=3)
         if lines != expected:
             complain(f"{title}: only the order of lines")
 

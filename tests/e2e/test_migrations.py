@@ -80,15 +80,16 @@ def upgrade(example):
             reason = error
         complain(f"{action} fails: {reason}", [text])
     rows = sum(tables(), [])
-    output = re.sub(r"==\d+==|0x\w+ ", "", result.output).splitlines()
-    own = [line for line in output if "main/tesselupgrader.cpp" in line]
+    output = re.sub(r"==\d+==|0x\w+ ", "", result.output)
+    lines = output.splitlines()
+    own = [line for line in lines if "main/tesselupgrader.cpp" in line]
     named = [name for _, name in rows if re.search(rf"\b{name}\b", str(own))]
     action = " or ".join(dict.fromkeys(named)) or last_action(
         example, start, rows, lambda again: again.status == result.status
     )
     title = f"{action} ends the tool with status {result.status}"
-    reason = re.findall("(?i)error: .*", result.output)
-    complain(": ".join([title, *reason[:1]]), (own or output) + result.log)
+    reason = re.findall("(?i)error: .*", output)
+    complain(": ".join([title, *reason[:1]]), (own or lines) + result.log)
 
 
 def find_transactions(example):

@@ -96,6 +96,27 @@ TEST_F(KeyVal, CancelledThreadFinishesWhatItBegan) {
   EXPECT_EQ(Steps([] { const fileops::Descriptor Fd(dup(0)); }), 1);
 }
 
+TEST_F(KeyVal, CancelledReaderLeavesNothingOpen) {
+  WriteFile(NAME, "a=1\n");
+  const auto NextFree = [] {  // a reader opens two: for the lock, and for reading
+    const fileops::Descriptor First(dup(0));
+    const fileops::Descriptor Second(dup(0));
+    return Numbers{First.Get(), Second.Get()};
+  };
+  const Numbers Before = NextFree();
+  for (int Time = 0; Time < 200; ++Time) {
+    std::thread Reader([] {
+      std::string strVal;
+      while (KiFileGetVal(NAME, "a", strVal) == 1) {
+      }
+    });
+    usleep(1000);
+    pthread_cancel(Reader.native_handle());
+    Reader.join();
+    ASSERT_EQ(NextFree(), Before);
+  }
+}
+
 TEST_F(KeyVal, LockExcludesOthersAsLongAsItIsTold) {
   KiFlock Held(NAME);
   KiFlock Other(NAME);
