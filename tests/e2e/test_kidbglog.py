@@ -162,4 +162,5 @@ def test_messages(kidbglog, there, command, message):
         there = 2568
     if there:
         make_segment(there)
-    assert kidbglog(command).startswith(message.replace(" ", " kidbglog: ", 1))
+    message = message.replace(" ", " kidbglog: ", 1)
+    assert kidbglog(command)[: len(message)] == message

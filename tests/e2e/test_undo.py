@@ -29,6 +29,8 @@ START = """
     INSERT INTO output VALUES (3, 'Door');
     CREATE TABLE relay (id INTEGER PRIMARY KEY, output REFERENCES output);
     INSERT INTO relay VALUES (7, 3);
+    CREATE TABLE wire (id PRIMARY KEY, output REFERENCES output) WITHOUT ROWID;
+    INSERT INTO wire VALUES ('cut', 99), ('whole', 3);
     CREATE TABLE word (id INTEGER PRIMARY KEY, w COLLATE NOCASE, n);
     INSERT INTO word VALUES (1, 'case', 1), (2, '', 1);
     CREATE TRIGGER act AFTER INSERT ON word
@@ -49,6 +51,7 @@ UPGRADE = """
     UPDATE word SET w = 'CASE' WHERE id = 1;
     UPDATE word SET n = 1.0 WHERE id = 2;
     DELETE FROM relay;
+    DELETE FROM wire WHERE id = 'whole';
     INSERT INTO output VALUES (4, 'Siren');
     DELETE FROM tag WHERE t = 'y';
     UPDATE tag SET t = 'X', number = 3, rowid = 2 WHERE t = 'x';"""
