@@ -58,7 +58,7 @@ void CheckVersion(const std::string& strVersion) {
   const std::string strNumber = strVersion.substr(strVersion.rfind('-') + 1);
   if (!IsNumber(strVersion)) {
     const bool blPackage = IsNumber(strNumber) && strVersion.size() > strNumber.size() + 1;
-    throw Failure("not a version number: " + strVersion +
+    throw Failure("not a version number: '" + strVersion + "'" +
                   (blPackage ? " (give the number after the last hyphen: " + strNumber + ")" : ""));
   }
   // A number beyond 64 bits gives the highest one.

@@ -62,7 +62,7 @@ def test_without_a_directory_syslog_says_so(
 STEP = b"pan= step\n"
 BINARY = bytes(range(11, 256)) * 400 + b"\na=\0\n"
 OTHERS = b"#pan=yes\nPAN=yes\npann=yes\nx=pan\n=pan\npan\n\r\n \n"
-LARGE = b"pan=yes\n".rjust(2**24 + 1, b"\n")
+LARGE = b"pan=yes\n".ljust(2**24 + 1, b"x")
 FILES = {
     # a name, the file's text before and after an upgrade
     "../where a link leads": (b"pan=yes\n", STEP),

@@ -243,7 +243,7 @@ MESSAGES = [
     ("--colour 0", "unrecognized option '--colour'"),
     ("--json --check 0", "only one of --summary, --json, --list and --check"),
     ("4294967296", "version 4294967296 is beyond 32 bits"),
-    ("8.2.0-2401", "8.2.0-2401 (give the number after the last hyphen: 2401)"),
+    ("8.2.0-2401", "0-2401' (give the number after the last hyphen: 2401)"),
     ("{}/@camveld 0", "@camveld is not a regular file"),
     ("{}/no\x9bne 0", "no\\xc2\\x9bne: No such file or directory"),
     ("{}/text 0", "text: file is not a database"),
