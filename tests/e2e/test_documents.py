@@ -1,14 +1,10 @@
 """What documents say of programs, scripts and files."""
 
 import re
-import subprocess
 
 import pytest
 from conftest import KIDBGLOG, PREVIEW, SOURCE, TOOL, complain, run
 from test_migrations import tables
-
-TRACKED = subprocess.check_output(["git", "ls-files"], cwd=SOURCE, text=True)
-DOCUMENTS = re.findall(r".*\.md$", TRACKED, re.M)
 
 # For each status of a program's man page, arguments that lead to it.
 STATUSES = {
@@ -49,20 +45,6 @@ def test_man_page_is_right(appliance, tmp_path, program):
     assert seen == statuses(page)
     if program == TOOL:
         assert seen == statuses((SOURCE / "README.md").read_text())
-
-
-@pytest.mark.parametrize("document", DOCUMENTS)
-def test_links_and_named_files_exist(document):
-    text = (SOURCE / document).read_text()
-    # The target of each link, without #section. Those of other sites differ.
-    links = re.findall(r"[^[]\]\(([^):#]+)[^):]*\)", text)
-    rooms = "scripts|tools|examples|docs|tests|packaging"
-    named = re.findall(rf"(?<![\w./-])(?:{rooms})/[\w./-]*\w", text)
-    paths = [(SOURCE / document).parent / link for link in links]
-    paths += [SOURCE / name for name in named]
-    missing = [path for path in paths if not path.exists()]
-    # The file that a reader makes.
-    assert not [path for path in missing if path.parent.name != "KICapInfo"]
 
 
 def test_the_page_on_migrations_lists_every_action():

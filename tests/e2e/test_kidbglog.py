@@ -6,7 +6,6 @@ import os
 import re
 import struct
 import subprocess
-import threading
 import time
 from pathlib import Path
 from subprocess import DEVNULL, Popen
@@ -113,25 +112,6 @@ def test_changes_wait_for_each_other_and_show_for_none(kidbglog, appliance):
         assert said == f"kidbglog: {held} for 10 seconds\n", change
     assert kidbglog("show").startswith("0 all categories: notice")
     os.close(directory)
-
-
-def test_only_a_process_gets_a_threshold(kidbglog):
-    kidbglog("create")
-    stop = threading.Event()
-    thread = threading.Thread(target=stop.wait, daemon=True)
-    thread.start()
-    refusal = f"1 kidbglog: there is no process {thread.native_id}"
-    assert kidbglog(f"pid {thread.native_id} info") == refusal
-    stop.set()
-
-
-@pytest.mark.parametrize("command", ["--help", "--version", "show"])
-def test_output_that_is_lost_is_a_failure(kidbglog, appliance, command):
-    kidbglog("create")
-    full = ["sh", "-c", 'exec "$@" >/dev/full', "sh"]
-    ended = run(*full, *appliance.command(KIDBGLOG, command))
-    said = "kidbglog: cannot write: No space left on device\n"
-    assert (ended.returncode, ended.stdout) == (1, said)
 
 
 MESSAGES = [

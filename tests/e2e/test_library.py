@@ -1,19 +1,15 @@
-"""The library in programs: from start to end, in failing calls, together."""
+"""The library in programs: from start to end, and in failing calls."""
 
 import errno
 import fcntl
 import os
 import re
-import time
 from pathlib import Path
-from subprocess import Popen
 
 import pytest
 from conftest import CLIENT, KIDBGLOG, STRACE, run
 
 FILE = Path("/var/services/camveld/f")
-# What the client writes: time, thread, the number of the line, some zeros.
-LINE = re.compile(r"(\w{3} [ \d]\d \S+\.\d{3}) (\S+) f:1:Fn\(\): (\d+) (0+)")
 
 
 def test_configuration_is_attached_from_start_to_end(appliance):
@@ -88,31 +84,3 @@ def test_a_log_that_stays_locked_loses_a_line_and_holds_nobody(appliance):
         fcntl.flock(log, fcntl.LOCK_SH)
         assert run(*no_time_passes, *client).returncode == 1
     assert appliance.log() == []
-
-
-def test_lines_stay_whole_and_in_order_while_the_log_is_rotated(appliance):
-    client = appliance.command(CLIENT, "write")
-    writers = [Popen(client) for _ in range(8)]
-    logs = []
-    for rotation in range(10):
-        time.sleep(0.5)
-        if appliance.log_file.exists():
-            old = f"{appliance.log_file}.{rotation}"
-            logs.append(appliance.log_file.rename(old))
-    for writer in writers:
-        writer.kill()
-        writer.wait()
-    numbers = {}  # of the last line of each thread
-    for log in logs:
-        last_time = ""
-        for line in log.read_text().splitlines():
-            parts = LINE.fullmatch(line)
-            assert parts, f"not a whole line in {log.name}: {line}"
-            written, thread, number, zeros = parts.groups()
-            due = numbers.get(thread, 0) + 1
-            assert int(number) == due, f"not line {due} of {thread}: {line}"
-            assert len(zeros) == due % 300 + 1, f"not a whole line: {line}"
-            assert written >= last_time, f"before {last_time}: {line}"
-            numbers[thread] = due
-            last_time = written
-    assert len(numbers) >= 4, "fewer than two processes have written"

@@ -1,18 +1,9 @@
-"""Whole runs: under Valgrind, and beside other processes."""
+"""Whole runs beside other processes."""
 
 from subprocess import Popen
 
 import pytest
 from conftest import STRACE, TOOL, run
-
-
-def test_valgrind_finds_nothing(example):
-    if example.preset != "release":
-        pytest.skip("Valgrind runs neither sanitized nor foreign programs")
-    valgrind = "valgrind -q --error-exitcode=99 --leak-check=full".split()
-    result = example.upgrade(0, under=valgrind)
-    result.must_be(0)
-    assert result.output == ""
 
 
 def left_behind(appliance):

@@ -5,7 +5,6 @@
 
 #include <cassert>
 
-#include "fileutils.h"
 #include "rig.h"
 #include "zamoc.h"
 
@@ -30,17 +29,6 @@ static void FuzzCapabilityFile(const std::string& strText, const std::string& st
   assert(ZAMOCFile(NAME, &gPatience).Get("k") == strVal);
 }
 
-static void FuzzKeyValueFile(const std::string& strText, const std::string& strVal) {
-  std::map<std::string, std::string> Before;
-  std::map<std::string, std::string> After;
-  WriteFile(NAME, strText);
-  KiFileGetAllKeyVals(NAME, Before);
-  KiFileSetVal(NAME, "k", strVal.c_str(), true);
-  KiFileGetAllKeyVals(NAME, After);
-  Before["k"] = strVal;
-  assert(After == Before);
-}
-
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* pData, size_t Size) {
   FuzzedDataProvider Input(pData, Size);
   std::string strVal = Input.ConsumeRandomLengthString(9);
@@ -48,6 +36,5 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* pData, size_t Size) {
   strVal.resize(std::min(strVal.size(), strVal.find_first_of(strExcluded)));
   const std::string strText = Input.ConsumeRemainingBytesAsString();
   FuzzCapabilityFile(strText, strVal);
-  FuzzKeyValueFile(strText, strVal);
   return 0;
 }

@@ -8,7 +8,6 @@
 
 #include <cstdio>
 #include <string>
-#include <thread>
 
 static void PrintAttached() { printf("%d", g_pDbgLogCfg != nullptr); }
 
@@ -24,14 +23,7 @@ static struct Global {
 
 __attribute__((destructor(101))) static void AtTheVeryEnd() { End(); }
 
-// Lines of a number and some zeros, until the process is killed.
-static void WriteLines() {
-  for (int Line = 1;; ++Line) {
-    KiPrintf(KI_LOG, nullptr, nullptr, "f", 1, "Fn", "%d %0*d\n", Line, Line % 300 + 1, 0);
-  }
-}
-
-// loop | write | get FILE KEY | set FILE KEY VALUE
+// loop | get FILE KEY | set FILE KEY VALUE
 int main(int /*argc*/, char** argv) {
   const std::string strCommand = argv[1];
   PrintAttached();
@@ -39,13 +31,6 @@ int main(int /*argc*/, char** argv) {
   while (strCommand == "loop") {
     KIDBGLOG(LOG_CATEG_RTSP_SERVER, LOG_LEVEL_DEBUG, "x\n");
     usleep(10000);
-  }
-  if (strCommand == "write") {
-    static KiDbgLogCfg Cfg = {};
-    Cfg.SetLogInMs(true);
-    g_pDbgLogCfg = &Cfg;
-    const std::thread Other(WriteLines);
-    WriteLines();
   }
   std::string strVal;
   return strCommand == "get" ? KiFileGetVal(argv[2], argv[3], strVal) < 0

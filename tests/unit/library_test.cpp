@@ -1,6 +1,5 @@
 // The library: key-value files, the log, the helpers.
 
-#include <fcntl.h>
 #include <pthread.h>
 
 #include <csignal>
@@ -96,27 +95,6 @@ TEST_F(KeyVal, CancelledThreadFinishesWhatItBegan) {
   EXPECT_EQ(Steps([] { const fileops::Descriptor Fd(dup(0)); }), 1);
 }
 
-TEST_F(KeyVal, CancelledReaderLeavesNothingOpen) {
-  WriteFile(NAME, "a=1\n");
-  const auto NextFree = [] {  // a reader opens two: for the lock, and for reading
-    const fileops::Descriptor First(dup(0));
-    const fileops::Descriptor Second(dup(0));
-    return Numbers{First.Get(), Second.Get()};
-  };
-  const Numbers Before = NextFree();
-  for (int Time = 0; Time < 200; ++Time) {
-    std::thread Reader([] {
-      std::string strVal;
-      while (KiFileGetVal(NAME, "a", strVal) == 1) {
-      }
-    });
-    usleep(1000);
-    pthread_cancel(Reader.native_handle());
-    Reader.join();
-    ASSERT_EQ(NextFree(), Before);
-  }
-}
-
 TEST_F(KeyVal, LockExcludesOthersAsLongAsItIsTold) {
   KiFlock Held(NAME);
   KiFlock Other(NAME);
@@ -203,32 +181,6 @@ TEST(Utils, ThreadIsDetachedOrNot) {
       pthread_join(Id, nullptr);
     }
   }
-}
-
-int32_t WriteAll(int Fd, const void* pBuf, int32_t Len) {
-  return fileops::WriteAll(Fd, pBuf, static_cast<size_t>(Len)) == 0 ? Len : -1;
-}
-
-TEST(Utils, WritingGoesOnAfterSignalsAndFullPipes) {
-  const std::string strText = ReadFile("/proc/self/exe").substr(0, 1 << 18);
-  const auto Len = static_cast<int32_t>(strText.size());
-  ASSERT_EQ(Len, 1 << 18);
-  for (const auto& [Flags, pWrite] :
-       {std::pair(0, &WriteFd), std::pair(O_NONBLOCK, &WriteFd), std::pair(0, &WriteAll)}) {
-    int rgFd[2];
-    ASSERT_EQ(pipe2(rgFd, Flags), 0);
-    std::thread Reader([&rgFd, &strText] {
-      usleep(50000);
-      EXPECT_TRUE(ReadFile("/dev/fd/" + itos(rgFd[0])) == strText);
-    });
-    Interrupt(10000);  // the second signal finds a call that has written nothing
-    EXPECT_EQ(pWrite(rgFd[1], strText.data(), Len), Len);
-    Interrupt(0);
-    close(rgFd[1]);
-    Reader.join();
-    close(rgFd[0]);
-  }
-  EXPECT_EQ(WriteFd(-1, "x", 1), 0);
 }
 
 }  // namespace
