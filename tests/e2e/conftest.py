@@ -341,12 +341,13 @@ def preview(example):
     example.directory.chmod(0o755)  # others cannot replace a change file
 
     def run_preview(*arguments, under=(), status=0, tool=own_tool):
-        before = example.state()
+        before, saved = example.state(), example.save()
         program = programs / PREVIEW
         command = example.command(program, "--tool", tool, *arguments)
         ended = run("env", f"TMPDIR={temporary}", *under, *command)
         assert ended.returncode == status, ended.stdout
         example.must_be_as(before)
+        assert example.save() == saved, "its database or a file was written"
         assert not os.listdir(temporary)
         return ended.stdout
 

@@ -21,8 +21,7 @@ def statuses(page):
 
 def options(text):
     """Returns the long options that a text names."""
-    others = {"--help", "--version", "--follow", "--no"}  # two are of patch
-    return set(re.findall("--[a-z]+", text)) - others
+    return set(re.findall("--[a-z]+", text)) - {"--help", "--version"}
 
 
 @pytest.mark.parametrize("program", STATUSES)
