@@ -29,7 +29,6 @@ LOG_START = re.compile(r"^\w{3} [ \d]\d [\d:]{8} \[\d+\] ?", re.M)
 TO_ACCEPT = "to accept: "
 ACCEPTED = pytest.StashKey[dict]()  # texts of the expected files by path
 complaints = set()  # of all tests so far
-
 # User, error, time and program of a syslog record.
 SYSLOG_PREFIX = re.compile(r"^<11>.{15} tesselupgrader: ")
 

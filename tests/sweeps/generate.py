@@ -38,6 +38,8 @@ c0 REFERENCES {}, c1 UNIQUE
 c0 UNIQUE, c1 REFERENCES {} ON UPDATE CASCADE ON DELETE SET NULL
 """.strip().splitlines()
 EXTRAS = """
+CREATE INDEX ix_{0} ON {0} (c0)
+
 CREATE INDEX some_{0} ON {0} (c0) WHERE c1 > 0
 
 CREATE UNIQUE INDEX all_{0} ON {0} (typeof(c0), c0, hex(c1))
